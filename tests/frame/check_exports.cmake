@@ -1,0 +1,26 @@
+# Checks that the module's shared library exports exactly the entry table and
+# the four entry functions, and carries its own file name as soname.
+execute_process(COMMAND nm -D --defined-only ${LIB} OUTPUT_VARIABLE syms RESULT_VARIABLE rc)
+if(NOT rc EQUAL 0)
+  message(FATAL_ERROR "nm failed on ${LIB}")
+endif()
+string(REGEX MATCHALL "[^\n]+" lines "${syms}")
+set(exported "")
+foreach(line ${lines})
+  # "<address> <type> <name>"; the linker's own markers are not ours.
+  string(REGEX REPLACE "^[0-9a-fA-F]+ +[A-Za-z] +" "" name "${line}")
+  if(NOT name MATCHES "^(_init|_fini|__bss_start|_edata|_end)$")
+    list(APPEND exported ${name})
+  endif()
+endforeach()
+list(SORT exported)
+set(want APIRouterRulesLoad APIRouterRulesSave APIRulesLoad APIRulesSave GetAPITable gTable)
+if(NOT exported STREQUAL want)
+  message(FATAL_ERROR "exported symbols: ${exported}\nexpected: ${want}")
+endif()
+
+execute_process(COMMAND objdump -p ${LIB} OUTPUT_VARIABLE dyn)
+if(NOT dyn MATCHES "SONAME +ORVI\\.Core\\.Network\\.TrafficControl\\.so\n")
+  message(FATAL_ERROR "soname is not ORVI.Core.Network.TrafficControl.so")
+endif()
+message(STATUS "exports and soname as expected: ${exported}")
