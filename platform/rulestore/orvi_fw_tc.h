@@ -3,7 +3,9 @@
  * directory's rules.
  *
  * Error stack codes recorded by the rule store (OLIBCErrGet):
- *   0x0016  a NULL argument, an invalid adapter name or directory path
+ *   0x0016  a NULL argument, an invalid adapter name or directory path (".."),
+ *           a close under another directory or adapter than the open, or an
+ *           ORVI_TC_APPLY other than "kernel" and "plan"
  *   0x0200  out of memory
  *   0x0201  a directory or rule file cannot be opened, read or written
  *   0x0300  a rule file is malformed or truncated
@@ -13,6 +15,13 @@
  *   0x0304  a rule names an unknown service or its port list is unusable
  *   0x0305  a device would need more filters than the store allows
  *   0x0306  applying a batch with tc failed
+ *   0x0307  an enabled rule's rates are unusable (minrate below 1, maxrate
+ *           negative, or a non-zero maxrate below minrate)
+ *
+ * Reload results: 0 all applied; -2 (0x0301) and -3 (0x0302) the bound
+ * checks; -1 a directory or file that cannot be read, a malformed file,
+ * unusable rates or a bad ORVI_TC_APPLY; the generator's own negative value
+ * (never -2 or -3) when it refuses a rule or tc fails.
  */
 #ifndef ORVI_FW_TC_H
 #define ORVI_FW_TC_H
@@ -30,6 +39,7 @@ extern "C" {
 #define ORVI_TC_ERR_PORTS 0x0304
 #define ORVI_TC_ERR_TOOMANY 0x0305
 #define ORVI_TC_ERR_APPLY 0x0306
+#define ORVI_TC_ERR_RATE 0x0307
 
 typedef enum _tag_orvi_firewall_protocol_ {
   ORVI_FW_PROTO_TCP = 1,
