@@ -8,7 +8,8 @@ namespace SDK {
 namespace Network {
 
 /* Fills interfaces (made an array) with one object per network interface of
- * the appliance root's sys/class/net, in name order:
+ * the appliance root's sys/class/net (its directories; plain files such as
+ * bonding_masters are skipped), in name order:
  *   "id"          string   the interface name
  *   "bridge"      bool     true when the interface is a bridge
  *   "speed_mbps"  int      link speed in Mbit/s, -1 when unknown
