@@ -38,10 +38,4 @@ TEST(PortsCheck, Table) {
   EXPECT_EQ(ORVIServiceConfPortsCheck(nullptr), 0);
 }
 
-// A digit text embedded in a longer buffer is judged by its NUL, not beyond.
-TEST(PortsCheck, StopsAtTheTerminator) {
-  const char text[] = {'8', '0', '\0', '9', '9', '9', '9', '9', '\0'};
-  EXPECT_EQ(ORVIServiceConfPortsCheck(text), 1);
-}
-
 }  // namespace
