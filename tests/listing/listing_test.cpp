@@ -124,59 +124,25 @@ TEST(RulesLoad, StoreOutcomes) {
       "port format should be one of ALL/SELF/SYS, ex: ALL::src, SELF:777:src, SYS:cifs[0x0000 :0]";
   fake::StoredRule nullPorts = Rule(2, "");
   nullPorts.portsNull = true;
+  const Strings both = {"get eth0", "free eth0"};
+  // clang-format off
   const StoreCase cases[] = {
-      {"nothing stored", {}, false, {}, R"({"rules":[],"total":0})", {}, {"get eth0", "free eth0"}},
-      {"count 2, no chain",
-       {},
-       true,
-       {2, true},
-       R"({"rules":[],"total":2})",
-       {},
-       {"get eth0", "free eth0"}},
-      {"total is the store's count",
-       {Rule(1, "ALL")},
-       true,
-       {5, false},
+      {"nothing stored", {}, false, {}, R"({"rules":[],"total":0})", {}, both},
+      {"count 2, no chain", {}, true, {2, true}, R"({"rules":[],"total":2})", {}, both},
+      {"total is the store's count", {Rule(1, "ALL")}, true, {5, false},
        R"({"total":5,"rules":[{"enabled":true,"port_type":"ALL","protocol":"tcp","minrate":100,
-           "maxrate":200,"source":"all","ip_direction":"dest"}]})",
-       {},
-       {"get eth0", "free eth0"}},
-      {"read fails",
-       {Rule(1, "ALL")},
-       true,
-       {-1, false},
-       nullptr,
+           "maxrate":200,"source":"all","ip_direction":"dest"}]})", {}, both},
+      {"read fails", {Rule(1, "ALL")}, true, {-1, false}, nullptr,
        {"Failed to load Tc rules for adapter [eth0][0x0201 ORVIFwTcRuleGetByAdapter:1]"},
        {"get eth0", "free NULL"}},
-      {"second of three empty",
-       {Rule(1, "ALL"), Rule(2, ""), Rule(3, "ALL")},
-       false,
-       {},
-       nullptr,
-       {"Ports format error[0x0000 :0]"},
-       {"get eth0", "free eth0"}},
-      {"second of three NULL",
-       {Rule(1, "ALL"), nullPorts, Rule(3, "ALL")},
-       false,
-       {},
-       nullptr,
-       {"Ports format error[0x0000 :0]"},
-       {"get eth0", "free eth0"}},
-      {"unknown prefix",
-       {Rule(1, "ALL"), Rule(2, "TCP:80:src")},
-       false,
-       {},
-       nullptr,
-       {hint},
-       {"get eth0", "free eth0"}},
-      {"empty direction",
-       {Rule(1, "SELF:80:")},
-       false,
-       {},
-       nullptr,
-       {hint},
-       {"get eth0", "free eth0"}},
+      {"second of three empty", {Rule(1, "ALL"), Rule(2, ""), Rule(3, "ALL")}, false, {}, nullptr,
+       {"Ports format error[0x0000 :0]"}, both},
+      {"second of three NULL", {Rule(1, "ALL"), nullPorts, Rule(3, "ALL")}, false, {}, nullptr,
+       {"Ports format error[0x0000 :0]"}, both},
+      {"unknown prefix", {Rule(1, "ALL"), Rule(2, "TCP:80:src")}, false, {}, nullptr, {hint}, both},
+      {"empty direction", {Rule(1, "SELF:80:")}, false, {}, nullptr, {hint}, both},
   };
+  // clang-format on
   for (const StoreCase& c : cases) {
     SCOPED_TRACE(c.name);
     Fresh();
@@ -294,16 +260,23 @@ TEST(RouterRulesLoad, UnknownDirection) {
   }
 }
 
+// A router answer in short: "a1,a2 total 2", or "error 1201".
+std::string Summary(const ORVI::APIResponse& resp) {
+  if (!resp.Success()) return "error " + std::to_string(resp.ErrorCode());
+  std::string out;
+  for (const std::string& s : Sources(resp)) out += (out.empty() ? "" : ",") + s;
+  EXPECT_TRUE(resp.Data()["rules"].isArray());
+  return out + " total " + Text(resp.Data()["total"]);
+}
+
 struct WalkCase {
   const char* name;
   const char* direction;
   Strings bridges;
   std::map<std::string, fake::RuleFile> stored;
   std::map<std::string, fake::GetScript> scripts;
-  std::map<std::string, int> failCalls;
-  int code;  // 0: success
-  Strings sources;
-  int total;
+  const char* failCall;  // its first call fails; nullptr: none
+  const char* answer;    // Summary()
   Strings logs;
   Strings calls;
 };
@@ -315,181 +288,55 @@ TEST(RouterRulesLoad, WalksAdaptersInOrder) {
   const fake::RuleFile a2 = {Rule(1, "ALL", 1, 1, 2, "a1"), Rule(2, "ALL", 1, 1, 2, "a2")};
   const fake::RuleFile b1 = {Rule(1, "ALL", 1, 1, 2, "b1")};
   const fake::RuleFile bBad = {Rule(1, "ALL", 1, 1, 2, "b1"), Rule(2, "ALL::")};
+  const Strings two = {"get br0", "free br0", "get br1", "free br1"};
+  // clang-format off
   const WalkCase cases[] = {
-      {"upload, nothing stored",
-       "upload",
-       {},
-       {},
-       {},
-       {},
-       0,
-       {},
-       0,
-       {},
+      {"upload, nothing stored", "upload", {}, {}, {}, nullptr, " total 0", {},
        {"get upload", "free upload"}},
-      {"upload",
-       "upload",
-       {"br0"},
-       {{"upload", a2}, {"br0", b1}},
-       {},
-       {},
-       0,
-       {"a1", "a2"},
-       2,
-       {},
+      {"upload", "upload", {"br0"}, {{"upload", a2}, {"br0", b1}}, {}, nullptr, "a1,a2 total 2", {},
        {"get upload", "free upload"}},
-      {"only gbr", "download", {"gbr"}, {{"gbr", a2}}, {}, {}, 0, {}, 0, {}, {}},
-      {"same three twice",
-       "download",
-       {"br0", "gbr", "br1"},
-       {{"br0", three}, {"br1", three}, {"gbr", a2}},
-       {},
-       {},
-       0,
-       {"r1", "r2", "r3", "r1", "r2", "r3"},
-       3,
-       {},
-       {"get br0", "free br0", "get br1", "free br1"}},
-      {"last count wins",
-       "download",
-       {"br0", "br1"},
-       {{"br0", three}, {"br1", a2}},
-       {},
-       {},
-       0,
-       {"r1", "r2", "r3", "a1", "a2"},
-       2,
-       {},
-       {"get br0", "free br0", "get br1", "free br1"}},
-      {"second empty",
-       "download",
-       {"br0", "br1"},
-       {{"br0", a2}},
-       {},
-       {},
-       0,
-       {"a1", "a2"},
-       0,
-       {},
-       {"get br0", "free br0", "get br1", "free br1"}},
-      {"first empty stops",
-       "download",
-       {"br0", "br1"},
-       {{"br1", a2}},
-       {},
-       {},
-       0,
-       {},
-       0,
-       {},
+      {"only gbr", "download", {"gbr"}, {{"gbr", a2}}, {}, nullptr, " total 0", {}, {}},
+      {"same three twice", "download", {"br0", "gbr", "br1"},
+       {{"br0", three}, {"br1", three}, {"gbr", a2}}, {}, nullptr, "r1,r2,r3,r1,r2,r3 total 3", {},
+       two},
+      {"last count wins", "download", {"br0", "br1"}, {{"br0", three}, {"br1", a2}}, {}, nullptr,
+       "r1,r2,r3,a1,a2 total 2", {}, two},
+      {"second empty", "download", {"br0", "br1"}, {{"br0", a2}}, {}, nullptr, "a1,a2 total 0", {},
+       two},
+      {"first empty stops", "download", {"br0", "br1"}, {{"br1", a2}}, {}, nullptr, " total 0", {},
        {"get br0", "free br0"}},
-      {"count without chain",
-       "download",
-       {"br0", "br1"},
-       {{"br1", b1}},
-       {{"br0", {2, true}}},
-       {},
-       0,
-       {"b1"},
-       1,
-       {},
-       {"get br0", "free br0", "get br1", "free br1"}},
-      {"first gbr in any case removed",
-       "download",
-       {"br0", "GBR", "gbr"},
-       {{"br0", b1}, {"gbr", a2}},
-       {},
-       {},
-       0,
-       {"b1", "a1", "a2"},
-       2,
-       {},
+      {"count without chain", "download", {"br0", "br1"}, {{"br1", b1}}, {{"br0", {2, true}}},
+       nullptr, "b1 total 1", {}, two},
+      {"first gbr in any case removed", "download", {"br0", "GBR", "gbr"},
+       {{"br0", b1}, {"gbr", a2}}, {}, nullptr, "b1,a1,a2 total 2", {},
        {"get br0", "free br0", "get gbr", "free gbr"}},
-      {"second read fails",
-       "download",
-       {"br0", "br1"},
-       {{"br0", a2}, {"br1", b1}},
-       {{"br1", {-1, false}}},
-       {},
-       1201,
-       {},
-       0,
+      {"second read fails", "download", {"br0", "br1"}, {{"br0", a2}, {"br1", b1}},
+       {{"br1", {-1, false}}}, nullptr, "error 1201",
        {"Failed to load Tc rules for adapter [br1][0x0201 ORVIFwTcRuleGetByAdapter:1]"},
        {"get br0", "free br0", "get br1", "free NULL"}},
-      {"second unreadable spec",
-       "download",
-       {"br0", "br1"},
-       {{"br0", a2}, {"br1", bBad}},
-       {},
-       {},
-       1201,
-       {},
-       0,
-       {"port format should be one of ALL/SELF/SYS, ex: ALL::src, SELF:777:src, "
-        "SYS:cifs[0x0000 :0]"},
-       {"get br0", "free br0", "get br1", "free br1"}},
-      {"enumeration fails",
-       "download",
-       {"br0"},
-       {{"br0", a2}},
-       {},
-       {{"OLIBNetEnumBridge", 1}},
-       1200,
-       {},
-       0,
-       {"Failed to OLIBNetEnumBridge [0x0201 OLIBNetEnumBridge:1]", "Bad parameters"},
+      {"second unreadable spec", "download", {"br0", "br1"}, {{"br0", a2}, {"br1", bBad}}, {},
+       nullptr, "error 1201", {"port format should be one of ALL/SELF/SYS, ex: ALL::src, "
+                               "SELF:777:src, SYS:cifs[0x0000 :0]"}, two},
+      {"enumeration fails", "download", {"br0"}, {{"br0", a2}}, {}, "OLIBNetEnumBridge",
+       "error 1200", {"Failed to OLIBNetEnumBridge [0x0201 OLIBNetEnumBridge:1]", "Bad parameters"},
        {}},
-      {"gbr removal fails",
-       "download",
-       {"br0", "gbr"},
-       {{"br0", a2}},
-       {},
-       {{"OLIBCSzListRemove", 1}},
-       1200,
-       {},
-       0,
-       {"Bad parameters"},
-       {}},
-      {"name list not allocated",
-       "upload",
-       {},
-       {{"upload", a2}},
-       {},
-       {{"OLIBCSzListAlloc", 1}},
-       1201,
-       {},
-       0,
-       {"Failed to OLIBCSzListAlloc [0x0201 OLIBCSzListAlloc:1]"},
-       {}},
-      {"upload not pushed",
-       "upload",
-       {},
-       {{"upload", a2}},
-       {},
-       {{"OLIBCSzListPush", 1}},
-       1201,
-       {},
-       0,
-       {"Failed to OLIBCSzListPush [0x0201 OLIBCSzListPush:1]"},
-       {}},
+      {"gbr removal fails", "download", {"br0", "gbr"}, {{"br0", a2}}, {}, "OLIBCSzListRemove",
+       "error 1200", {"Bad parameters"}, {}},
+      {"name list not allocated", "upload", {}, {{"upload", a2}}, {}, "OLIBCSzListAlloc",
+       "error 1201", {"Failed to OLIBCSzListAlloc [0x0201 OLIBCSzListAlloc:1]"}, {}},
+      {"upload not pushed", "upload", {}, {{"upload", a2}}, {}, "OLIBCSzListPush", "error 1201",
+       {"Failed to OLIBCSzListPush [0x0201 OLIBCSzListPush:1]"}, {}},
   };
+  // clang-format on
   for (const WalkCase& c : cases) {
     SCOPED_TRACE(c.name);
     Fresh();
     S().bridges = c.bridges;
     for (const auto& s : c.stored) S().dirs["/etc/tc"][s.first] = s.second;
     S().getScript = c.scripts;
-    for (const auto& f : c.failCalls) fake::FailCall(f.first, f.second);
-    ORVI::APIResponse resp =
-        Load(&TCHandler::RouterRulesLoad, std::string(R"({"direction":")") + c.direction + "\"}");
-    if (c.code == 0) {
-      ASSERT_TRUE(resp.Success());
-      EXPECT_EQ(Sources(resp), c.sources);
-      EXPECT_TRUE(resp.Data()["rules"].isArray());
-      EXPECT_EQ(resp.Data()["total"], Json::Value(c.total));
-    } else {
-      EXPECT_EQ(resp.ErrorCode(), c.code);
-    }
+    if (c.failCall) fake::FailCall(c.failCall);
+    const std::string params = std::string(R"({"direction":")") + c.direction + "\"}";
+    EXPECT_EQ(Summary(Load(&TCHandler::RouterRulesLoad, params)), c.answer);
     EXPECT_EQ(fake::LogBodies(), c.logs);
     EXPECT_EQ(StoreCalls(), c.calls);
   }
