@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "ORVI.Core.Network.TrafficControl.h"
+#include "conflock.h"
 #include "olibc.h"
 #include "orvi_fw_tc.h"
 #include "preconditions.h"
@@ -165,6 +166,7 @@ bool RouterRulesGather(TCHandler& h, Json::Value& rules, int& total) {
   total = 0;
   {
     // Reads of the live directory.
+    conflock::LiveReader reading;
     for (int i = 0; i < names.Get()->count; ++i) {
       const char* item = OLIBCSzListGet(names.Get(), i);
       const std::string name = item != nullptr ? item : "";
@@ -190,6 +192,7 @@ void TCHandler::RulesLoad() {
   int total = 0;
   {
     // Reads of the live directory.
+    conflock::LiveReader reading;
     total = AdapterRulesRead(*this, adapter, rules);
   }
   LoadAnswer(*this, total >= 0, std::move(rules), total);

@@ -121,23 +121,33 @@ void TCHandler::RulesSave() {
 
 namespace {
 
+// The text that decides the direction. A value that is not a string never
+// matches; the log shows it as compact JSON, as the load does.
+std::string DirectionText(const Json::Value& direction) {
+  if (direction.isString()) return direction.asString();
+  if (direction.isNull()) return std::string();
+  Json::StreamWriterBuilder writer;
+  writer["indentation"] = "";
+  return Json::writeString(writer, direction);
+}
+
 // Fills the adapter list of a router save from "direction"; false when the
 // save must end with the code the handler holds.
 bool SelectAdapters(TCHandler& h, SzList*& list) {
   Json::Value param = h._pRequest->GetParam("direction", Json::Value());
   if (!param.isString()) TC_LOG("Bad parameters");
-  std::string direction = param.isString() ? param.asString() : std::string();
+  const std::string direction = DirectionText(param);
 
   list = OLIBCSzListAlloc(32);
   if (list == nullptr) {
-    TC_LOG_ERR("Failed to alloc memory");
+    TC_LOG_ERR("Failed to OLIBCSzListAlloc ");
     h._errCode = TC_ERR_FAILED;
     return false;
   }
   if (direction == "upload") {
     // Without the name the save would store nothing and still succeed.
     if (OLIBCSzListPush(&list, "upload") < 0) {
-      TC_LOG_ERR("Failed to alloc memory");
+      TC_LOG_ERR("Failed to OLIBCSzListPush ");
       h._errCode = TC_ERR_FAILED;
       return false;
     }
