@@ -44,7 +44,11 @@ extern "C" {
 typedef enum _tag_orvi_firewall_protocol_ {
   ORVI_FW_PROTO_TCP = 1,
   ORVI_FW_PROTO_UDP = 2,
-  ORVI_FW_PROTO_ALL = 3
+  ORVI_FW_PROTO_ALL = 3,
+  /* Stored records may hold any 32-bit number; these bounds make every
+     int32 value a valid value of the type, so reading one is defined. */
+  ORVI_FW_PROTO_INT32_MIN_ = -2147483647 - 1,
+  ORVI_FW_PROTO_INT32_MAX_ = 2147483647
 } _tag_orvi_firewall_protocol_;
 
 typedef struct _tag_orvi_firewall_tc_rule_ {
