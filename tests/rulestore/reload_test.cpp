@@ -127,18 +127,70 @@ TEST_F(Reload, UnknownApplyModeIsRefused) {
   EXPECT_EQ(OLIBCErrGet(), OLIBC_ERR_INVAL);
 }
 
-// Plan mode writes one batch per device, and nothing when any device fails.
+Rule WithSource(const char* source) {
+  Rule r = Enabled(10, 100);
+  r.source = source;
+  return r;
+}
+
+// Plan mode writes one batch per device, and none unless every device passes.
+struct PlanCase {
+  const char* name;
+  std::map<std::string, std::vector<Rule>> files;
+  const char* conf;
+  const char* mode;  // ORVI_TC_APPLY, nullptr for unset
+  int expect;
+  int error;
+  std::vector<std::string> plans;  // files of run/tc afterwards
+};
+
+// clang-format off
+const PlanCase kPlanCases[] = {
+  {"every device planned", {{"eth0", {Enabled(10, 100)}}, {"eth1", {Enabled(10, 125)}}}, "",
+   "plan", 0, 0, {"eth0.tc", "eth1.tc"}},
+  {"a bound failure plans nothing", {{"eth0", {Enabled(10, 100)}}, {"eth1", {Enabled(10, 126)}}},
+   "", "plan", -2, ORVI_TC_ERR_CEIL, {}},
+  {"a refused source plans nothing",
+   {{"eth0", {Enabled(10, 100)}}, {"eth1", {WithSource("10.0.0.300")}}}, "", "plan", -1,
+   ORVI_TC_ERR_SOURCE, {}},
+  {"upload planned on the WAN device", {{"upload", {Enabled(10, 100)}}}, "wan_interface=wan0\n",
+   "plan", 0, 0, {"wan0.tc"}},
+  {"plan is the default under a root", {{"eth0", {Enabled(10, 100)}}}, "", nullptr, 0, 0,
+   {"eth0.tc"}},
+  {"an empty rule file is planned too", {{"eth0", {}}}, "", "plan", 0, 0, {"eth0.tc"}},
+};
+// clang-format on
+
 TEST_F(Reload, PlansEveryDeviceOrNone) {
+  for (const PlanCase& c : kPlanCases) {
+    SCOPED_TRACE(c.name);
+    TearDown();
+    SetUp();
+    for (const char* dev : {"eth0", "eth1", "wan0"})
+      Put(std::string("/sys/class/net/") + dev + "/speed", "1");
+    Put("/etc/orviinfo.conf", c.conf);
+    for (const auto& f : c.files) ASSERT_EQ(Save(kDir, f.first.c_str(), f.second), 0);
+    if (c.mode == nullptr)
+      unsetenv("ORVI_TC_APPLY");
+    else
+      setenv("ORVI_TC_APPLY", c.mode, 1);
+    EXPECT_EQ(ORVIFwTcRuleReload(kDir), c.expect);
+    if (c.expect < 0) {
+      EXPECT_EQ(OLIBCErrGet(), c.error);
+    }
+    EXPECT_EQ(List("/run/tc"), c.plans);
+  }
+}
+
+TEST_F(Reload, EmptyRuleFileRestoresTheDefaultQdisc) {
   Put("/sys/class/net/eth0/speed", "1");
-  Put("/sys/class/net/eth1/speed", "1");
   ASSERT_EQ(Save(kDir, "eth0", {Enabled(10, 100)}), 0);
-  ASSERT_EQ(Save(kDir, "eth1", {Enabled(10, 126)}), 0);
-  EXPECT_EQ(ORVIFwTcRuleReload(kDir), -2);
-  EXPECT_TRUE(List("/run/tc").empty());
-  ASSERT_EQ(Save(kDir, "eth1", {Enabled(10, 125)}), 0);
-  EXPECT_EQ(ORVIFwTcRuleReload(kDir), 0);
-  EXPECT_EQ(List("/run/tc"), (std::vector<std::string>{"eth0.tc", "eth1.tc"}));
-  EXPECT_NE(Get("/run/tc/eth0.tc").find("eth0"), std::string::npos);
+  ASSERT_EQ(ORVIFwTcRuleReload(kDir), 0);
+  EXPECT_NE(Get("/run/tc/eth0.tc").find("htb"), std::string::npos);
+  ASSERT_EQ(Save(kDir, "eth0", {}), 0);
+  ASSERT_EQ(ORVIFwTcRuleReload(kDir), 0);
+  EXPECT_NE(Get("/run/tc/eth0.tc").find("qdisc del dev eth0 root"), std::string::npos);
+  EXPECT_EQ(Get("/run/tc/eth0.tc").find("htb"), std::string::npos);
 }
 
 }  // namespace
