@@ -81,6 +81,11 @@ void ORVIFwTcBufRulesFree(TcRule* rule);
 int ORVIFwTcRuleClose(const char* dir, TcRuleFile* file, const char* adapter);
 int ORVIFwTcRuleReload(const char* dir);
 
+/* Not used by the module: the tc batch that a reload of dir would apply to
+ * the device of adapter, after the same checks. *batch receives a heap
+ * string the caller frees; 0, or negative with an error recorded. */
+int ORVIFwTcRulePlan(const char* dir, const char* adapter, char** batch);
+
 #ifdef __cplusplus
 }
 #endif

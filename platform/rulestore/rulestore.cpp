@@ -344,48 +344,95 @@ int Unexpected() {
 // tcgen's failures must not read as the bound checks' -2 and -3.
 int GeneratorFailure(int r) { return r == -2 || r == -3 ? -1 : r; }
 
-int Reload(const char* dirArg) {
-  std::string dir;
-  if (!ResolveDir(dirArg, &dir)) return -1;
-  tcgen::ApplyMode mode;
-  if (!ApplyModeFromEnv(&mode)) return -1;
+// The rules of a directory grouped by device, every file read and every
+// device's bounds checked; files owns the records that devices point into.
+struct Collected {
+  std::vector<rulefile::Parsed> files;
+  std::map<std::string, tcgen::DeviceRules> devices;
+};
+
+int Collect(const std::string& dir, Collected* out) {
   std::vector<std::string> adapters;
   if (!ListAdapters(dir, &adapters)) return -1;
 
   // Every file is read before any device is looked at: one bad file stops
   // the whole reload.
-  std::vector<rulefile::Parsed> files(adapters.size());
+  out->files.resize(adapters.size());
   for (size_t i = 0; i < adapters.size(); ++i) {
-    Load load = LoadRuleFile(RulePath(dir, adapters[i]), &files[i]);
+    Load load = LoadRuleFile(RulePath(dir, adapters[i]), &out->files[i]);
     if (load == Load::kMissing) ORVI_ERR(OLIBC_ERR_IO);  // vanished since the listing
     if (load != Load::kOk) return -1;
   }
 
   // Rules of several adapters on one device (a file named after the WAN
   // device and "upload") are merged in adapter name order.
-  std::map<std::string, tcgen::DeviceRules> devices;
   for (size_t i = 0; i < adapters.size(); ++i) {
     std::string dev = DeviceOf(adapters[i]);
     if (dev.empty()) continue;
-    tcgen::DeviceRules& d = devices[dev];
+    tcgen::DeviceRules& d = out->devices[dev];
     d.device = dev;
-    for (const TcRule* r = files[i].head.get(); r != nullptr; r = r->next) d.rules.push_back(r);
+    for (const TcRule* r = out->files[i].head.get(); r != nullptr; r = r->next) d.rules.push_back(r);
   }
-  for (auto& entry : devices) {
+  for (auto& entry : out->devices) {
     entry.second.upperKBps = UpperBound(entry.first);
     int r = CheckBounds(entry.second);
     if (r < 0) return r;
   }
-  for (const auto& entry : devices) {
+  for (const auto& entry : out->devices) {
     int r = tcgen::Check(entry.second);
     if (r < 0) return GeneratorFailure(r);
   }
-  for (const auto& entry : devices) {
-    int r = tcgen::Apply(entry.first, tcgen::Generate(entry.second), mode);
+  return 0;
+}
+
+int Reload(const char* dirArg) {
+  std::string dir;
+  if (!ResolveDir(dirArg, &dir)) return -1;
+  tcgen::ApplyMode mode;
+  if (!ApplyModeFromEnv(&mode)) return -1;
+  Collected all;
+  int r = Collect(dir, &all);
+  if (r < 0) return r;
+  for (const auto& entry : all.devices) {
+    r = tcgen::Apply(entry.first, tcgen::Generate(entry.second), mode);
     if (r < 0) {
       syslog(LOG_ERR, "rulestore: applying the rules of %s failed", entry.first.c_str());
       return GeneratorFailure(r);
     }
+  }
+  return 0;
+}
+
+int Plan(const char* dirArg, const char* adapter, char** batch) {
+  if (batch == nullptr) {
+    ORVI_ERR(OLIBC_ERR_INVAL);
+    return -1;
+  }
+  *batch = nullptr;
+  if (adapter == nullptr || !ValidAdapter(adapter)) {
+    ORVI_ERR(OLIBC_ERR_INVAL);
+    return -1;
+  }
+  std::string dir;
+  if (!ResolveDir(dirArg, &dir)) return -1;
+  // The whole directory is checked, as a reload would, so a plan never shows
+  // a batch that the reload would refuse.
+  Collected all;
+  int r = Collect(dir, &all);
+  if (r < 0) return r;
+  std::string dev = DeviceOf(adapter);
+  if (dev.empty()) {
+    ORVI_ERR(OLIBC_ERR_INVAL);
+    return -1;
+  }
+  auto it = all.devices.find(dev);
+  tcgen::DeviceRules none;
+  none.device = dev;
+  none.upperKBps = UpperBound(dev);
+  *batch = strdup(tcgen::Generate(it != all.devices.end() ? it->second : none).c_str());
+  if (*batch == nullptr) {
+    ORVI_ERR(OLIBC_ERR_NOMEM);
+    return -1;
   }
   return 0;
 }
@@ -573,6 +620,14 @@ int ORVIFwTcRuleClose(const char* dir, TcRuleFile* file, const char* adapter) {
 int ORVIFwTcRuleReload(const char* dir) {
   try {
     return Reload(dir);
+  } catch (...) {
+    return Unexpected();
+  }
+}
+
+int ORVIFwTcRulePlan(const char* dir, const char* adapter, char** batch) {
+  try {
+    return Plan(dir, adapter, batch);
   } catch (...) {
     return Unexpected();
   }
