@@ -352,7 +352,7 @@ int ApplyKernel(const std::string& dev, const std::string& batch) {
   // A refused batch may have stopped halfway: put back the last good tree,
   // or the default qdisc when there never was one, never a partial tree.
   std::string previous;
-  const bool havePrevious = ReadFile(goodPath, &previous);
+  const bool havePrevious = ReadFile(goodPath, &previous) && !previous.empty();
   const std::string restore = havePrevious ? previous : detail::RestoreDefaultCommands(dev);
   if (RunTcBatch(restore, &err)) {
     syslog(LOG_WARNING, "tcgen: %s: %s", dev.c_str(),
@@ -370,6 +370,13 @@ int ApplyKernel(const std::string& dev, const std::string& batch) {
 int Apply(const std::string& device, const std::string& batch, ApplyMode mode) {
   if (!detail::ValidDeviceName(device)) {
     syslog(LOG_ERR, "tcgen: device name is not usable with tc");
+    ORVI_ERR(0x0016);
+    return -1;
+  }
+  if (batch.empty()) {
+    // Every generated batch has commands; an empty one would also become a
+    // last good batch that restores nothing.
+    syslog(LOG_ERR, "tcgen: %s: refusing an empty batch", device.c_str());
     ORVI_ERR(0x0016);
     return -1;
   }

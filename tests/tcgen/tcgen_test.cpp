@@ -353,13 +353,15 @@ TEST(ApplyPlan, WritesTheBatchAndNothingElse) {
   EXPECT_EQ(names, std::vector<std::string>{"br0.tc"});  // no temporary or lock files left
 }
 
-TEST(ApplyPlan, RefusesBadDeviceNamesBeforeTouchingFiles) {
+TEST(ApplyPlan, RefusesBadDeviceNamesAndEmptyBatchesBeforeTouchingFiles) {
   TempRoot root;
   for (const char* dev : {"../x", "", "-f", "a b"}) {
     OLIBCErrSetEx(0, "", 0);
     EXPECT_LT(tcgen::Apply(dev, "x\n", tcgen::ApplyMode::kPlan), 0) << dev;
     EXPECT_EQ(OLIBCErrGet(), kInval) << dev;
   }
+  EXPECT_FALSE(std::filesystem::exists(root.Path("run")));
+  EXPECT_LT(tcgen::Apply("br0", "", tcgen::ApplyMode::kPlan), 0);
   EXPECT_FALSE(std::filesystem::exists(root.Path("run")));
 }
 
