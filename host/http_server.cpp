@@ -164,6 +164,8 @@ int Serve(const Module& module, const ListenAddress& address, const std::string&
   sigaddset(&stopSignals, SIGINT);
   sigaddset(&stopSignals, SIGTERM);
   pthread_sigmask(SIG_BLOCK, &stopSignals, nullptr);
+  // A client that hangs up early must cost its connection only, not the server.
+  signal(SIGPIPE, SIG_IGN);
 
   httplib::Server server;
   server.set_payload_max_length(kMaxRequestBody);
