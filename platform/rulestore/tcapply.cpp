@@ -260,14 +260,16 @@ bool WriteAll(int fd, const std::string& data) {
   return true;
 }
 
-// Written beside the target and renamed over it: readers never see half a batch.
+// Written beside the target and renamed over it: readers never see half a
+// batch. No fsync: run/ does not outlive a reboot (and the kernel's tree does
+// not either), so it would only slow every apply down.
 bool WriteFileAtomic(const std::string& path, const std::string& data) {
   std::string tmpl = path + ".XXXXXX";
   std::unique_ptr<char[]> name(new char[tmpl.size() + 1]);
   std::memcpy(name.get(), tmpl.c_str(), tmpl.size() + 1);
   Fd fd(mkostemp(name.get(), O_CLOEXEC));
   if (!fd.Valid()) return false;
-  bool ok = fchmod(fd.Get(), 0644) == 0 && WriteAll(fd.Get(), data) && fsync(fd.Get()) == 0;
+  bool ok = fchmod(fd.Get(), 0644) == 0 && WriteAll(fd.Get(), data);
   fd.Reset();
   if (ok) ok = rename(name.get(), path.c_str()) == 0;
   if (!ok) unlink(name.get());
