@@ -17,18 +17,26 @@ namespace {
 
 Json::Value ParseJson(const std::string& text) {
   Json::Value value;
-  Json::CharReaderBuilder builder;
   std::string errors;
-  std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
   EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, &errors)) << text;
   return value;
 }
 
-// A validated rule; each case replaces or removes some of its members.
-Json::Value BaseRule() {
-  return ParseJson(
+// A validated rule; each case replaces some of its members ("-" removes one).
+Json::Value Rule(const std::string& patch = "{}") {
+  Json::Value rule = ParseJson(
       R"({"enabled":true,"protocol":"tcp","minrate":100,"maxrate":200,"source":"all",)"
       R"("ip_direction":"src","port_type":"SELF","port_num":"80","port_direction":"src"})");
+  Json::Value p = ParseJson(patch);
+  for (const auto& key : p.getMemberNames()) {
+    if (p[key] == "-") {
+      rule.removeMember(key);
+    } else {
+      rule[key] = p[key];
+    }
+  }
+  return rule;
 }
 
 // A record as the store hands it out: zeroed, no ports block yet.
@@ -58,229 +66,47 @@ class RecordTest : public ::testing::Test {
 
 struct FieldCase {
   const char* name;
-  const char* patch;                 // members replacing those of BaseRule()
-  std::vector<const char*> removed;  // members taken out of BaseRule()
+  const char* patch;
   const char* ports;
-  int enabled;
-  int protocol;
-  int minrate;
-  int maxrate;
-  std::string source;
-  int ipDirection;
+  int enabled, protocol, ipDirection;
   std::vector<std::string> logs;
 };
 
-const std::string k200(200, 's');
-
+// clang-format off
 const FieldCase kFieldCases[] = {
-    {"AllWithoutPortNum",
-     R"({"port_type":"ALL"})",
-     {"port_num"},
-     "ALL::src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"AllWithPortsDest",
-     R"({"port_type":"ALL","port_num":"80","port_direction":"dest"})",
-     {},
-     "ALL:80:dest",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"SelfList",
-     R"({"port_num":"80,443","port_direction":"dest"})",
-     {},
-     "SELF:80,443:dest",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"SysService",
-     R"({"port_type":"SYS","port_num":"cifs"})",
-     {},
-     "SYS:cifs:src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"AllPortNumArray",
-     R"({"port_type":"ALL","port_num":[80,443]})",
-     {},
-     "ALL::src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"AllPortNumObject",
-     R"({"port_type":"ALL","port_num":{"from":80}})",
-     {},
-     "ALL::src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"AllPortNumNumber",
-     R"({"port_type":"ALL","port_num":80})",
-     {},
-     "ALL:80:src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"AllPortNumNull",
-     R"({"port_type":"ALL","port_num":null})",
-     {},
-     "ALL::src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     1,
-     {}},
-    {"IpDirectionDest",
-     R"({"ip_direction":"dest"})",
-     {},
-     "SELF:80:src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     0,
-     {}},
-    {"IpDirectionUpperSrc",
-     R"({"ip_direction":"SRC"})",
-     {},
-     "SELF:80:src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     0,
-     {}},
-    {"IpDirectionIntegerDefault",
-     R"({"ip_direction":1})",
-     {},
-     "SELF:80:src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     0,
-     {}},
-    {"IpDirectionArray",
-     R"({"ip_direction":["src"]})",
-     {},
-     "SELF:80:src",
-     1,
-     1,
-     100,
-     200,
-     "all",
-     0,
-     {}},
-    {"Disabled", R"({"enabled":false})", {}, "SELF:80:src", 0, 1, 100, 200, "all", 1, {}},
-    {"UdpNoCeiling",
-     R"({"protocol":"udp","maxrate":0,"minrate":200000})",
-     {},
-     "SELF:80:src",
-     1,
-     2,
-     200000,
-     0,
-     "all",
-     1,
-     {}},
-    {"ProtocolAll", R"({"protocol":"all"})", {}, "SELF:80:src", 1, 3, 100, 200, "all", 1, {}},
-    {"ProtocolUpperCase",
-     R"({"protocol":"TCP"})",
-     {},
-     "SELF:80:src",
-     1,
-     3,
-     100,
-     200,
-     "all",
-     1,
-     {"bad parameters of protocol: TCP"}},
-    {"SourceAddress",
-     R"({"source":"192.168.1.0/24"})",
-     {},
-     "SELF:80:src",
-     1,
-     1,
-     100,
-     200,
-     "192.168.1.0/24",
-     1,
-     {}},
-    {"Source200Chars", nullptr, {}, "SELF:80:src", 1, 1, 100, 200, k200.substr(0, 127), 1, {}},
-    {"SourceObject", R"({"source":{"a":"b"}})", {}, "SELF:80:src", 1, 1, 100, 200, "", 1, {}},
-    {"MissingMembers",
-     "{}",
-     {"enabled", "protocol", "minrate", "maxrate", "source", "ip_direction", "port_type",
-      "port_num", "port_direction"},
-     "::",
-     0,
-     3,
-     0,
-     0,
-     "",
-     0,
-     {}},
+  {"AllWithoutPortNum",  R"({"port_type":"ALL","port_num":"-"})", "ALL::src", 1, 1, 1, {}},
+  {"AllPortsDest",       R"({"port_type":"ALL","port_direction":"dest"})", "ALL:80:dest", 1, 1, 1, {}},
+  {"SelfList",           R"({"port_num":"80,443","port_direction":"dest"})", "SELF:80,443:dest", 1, 1, 1, {}},
+  {"SysService",         R"({"port_type":"SYS","port_num":"cifs"})", "SYS:cifs:src", 1, 1, 1, {}},
+  {"AllPortNumArray",    R"({"port_type":"ALL","port_num":[80,443]})", "ALL::src", 1, 1, 1, {}},
+  {"AllPortNumObject",   R"({"port_type":"ALL","port_num":{"from":80}})", "ALL::src", 1, 1, 1, {}},
+  {"AllPortNumNumber",   R"({"port_type":"ALL","port_num":80})", "ALL:80:src", 1, 1, 1, {}},
+  {"IpDirectionDest",    R"({"ip_direction":"dest"})", "SELF:80:src", 1, 1, 0, {}},
+  {"IpDirectionUpper",   R"({"ip_direction":"SRC"})", "SELF:80:src", 1, 1, 0, {}},
+  {"IpDirectionInteger", R"({"ip_direction":1})", "SELF:80:src", 1, 1, 0, {}},
+  {"DisabledUdp",        R"({"enabled":false,"protocol":"udp"})", "SELF:80:src", 0, 2, 1, {}},
+  {"ProtocolUpperCase",  R"({"protocol":"TCP"})", "SELF:80:src", 1, 3, 1, {"bad parameters of protocol: TCP"}},
+  {"NothingButId",       R"({"enabled":"-","protocol":"-","ip_direction":"-","port_type":"-",)"
+                         R"("port_num":"-","port_direction":"-"})", "::", 0, 3, 0, {}},
 };
+// clang-format on
 
 class RecordFields : public RecordTest, public ::testing::WithParamInterface<FieldCase> {};
 
 TEST_P(RecordFields, FillsEveryField) {
   const FieldCase& c = GetParam();
-  Json::Value rule = BaseRule();
-  if (c.patch != nullptr) {
-    Json::Value patch = ParseJson(c.patch);
-    for (const auto& key : patch.getMemberNames()) rule[key] = patch[key];
-  } else {
-    rule["source"] = k200;
-  }
-  for (const char* key : c.removed) rule.removeMember(key);
-
   Record rec;
   TcRule* sentinel = reinterpret_cast<TcRule*>(0x1234);
   rec.rule->next = sentinel;
-  ASSERT_TRUE(h_.RuleCreate(7, rule, rec.rule));
+  ASSERT_TRUE(h_.RuleCreate(7, Rule(c.patch), rec.rule));
   ASSERT_NE(rec.rule->ports, nullptr);
   EXPECT_STREQ(rec.rule->ports, c.ports);
   EXPECT_EQ(rec.rule->id, 7);
   EXPECT_EQ(rec.rule->enabled, c.enabled);
   EXPECT_EQ(static_cast<int>(rec.rule->protocol), c.protocol);
-  EXPECT_EQ(rec.rule->minrate, c.minrate);
-  EXPECT_EQ(rec.rule->maxrate, c.maxrate);
-  EXPECT_EQ(std::string(rec.rule->source), c.source);
+  EXPECT_EQ(rec.rule->minrate, 100);
+  EXPECT_EQ(rec.rule->maxrate, 200);
+  EXPECT_STREQ(rec.rule->source, "all");
   EXPECT_EQ(rec.rule->ipDirection, c.ipDirection);
   EXPECT_EQ(rec.rule->next, sentinel);
   EXPECT_EQ(fake::LogBodies(), c.logs);
@@ -291,53 +117,45 @@ INSTANTIATE_TEST_SUITE_P(Cases, RecordFields, ::testing::ValuesIn(kFieldCases),
                            return std::string(info.param.name);
                          });
 
+TEST_F(RecordTest, LongSourceIsCut) {
+  Record rec;
+  Json::Value rule = Rule();
+  rule["source"] = std::string(200, 's');
+  ASSERT_TRUE(h_.RuleCreate(1, rule, rec.rule));
+  EXPECT_EQ(std::string(rec.rule->source), std::string(127, 's'));
+}
+
 TEST_F(RecordTest, ReusedRecordTakesEachRuleWholly) {
   Record rec;
-  Json::Value first = BaseRule();
-  first["port_num"] = "1000-2000,3000,4000";
-  first["source"] = "10.0.0.0/8";
-  ASSERT_TRUE(h_.RuleCreate(1, first, rec.rule));
-  ASSERT_STREQ(rec.rule->ports, "SELF:1000-2000,3000,4000:src");
-
-  Json::Value second = BaseRule();
-  second["port_type"] = "ALL";
-  second.removeMember("port_num");
-  second["enabled"] = false;
-  second["ip_direction"] = "dest";
-  ASSERT_TRUE(h_.RuleCreate(2, second, rec.rule));
+  ASSERT_TRUE(
+      h_.RuleCreate(1, Rule(R"({"port_num":"1000-2000,3000","source":"10.0.0.0/8"})"), rec.rule));
+  ASSERT_STREQ(rec.rule->ports, "SELF:1000-2000,3000:src");
+  ASSERT_TRUE(
+      h_.RuleCreate(2, Rule(R"({"port_type":"ALL","port_num":"-","minrate":5})"), rec.rule));
   // The shorter text replaces the longer one without a tail.
   EXPECT_EQ(std::string(rec.rule->ports), "ALL::src");
   EXPECT_STREQ(rec.rule->source, "all");
   EXPECT_EQ(rec.rule->id, 2);
-  EXPECT_EQ(rec.rule->enabled, 0);
-  EXPECT_EQ(rec.rule->ipDirection, 0);
+  EXPECT_EQ(rec.rule->minrate, 5);
 }
 
 TEST_F(RecordTest, NullRecordIsRefusedSilently) {
-  EXPECT_FALSE(h_.RuleCreate(1, BaseRule(), nullptr));
+  EXPECT_FALSE(h_.RuleCreate(1, Rule(), nullptr));
   EXPECT_THAT(fake::LogBodies(), ::testing::IsEmpty());
 }
 
 TEST_F(RecordTest, FailedAllocationLeavesRecordAsItWas) {
   Record rec;
-  Json::Value first = BaseRule();
-  first["source"] = "10.1.2.3";
-  ASSERT_TRUE(h_.RuleCreate(3, first, rec.rule));
-  TcRule before = *rec.rule;
-  std::string portsBefore = rec.rule->ports;
+  ASSERT_TRUE(h_.RuleCreate(3, Rule(R"({"source":"10.1.2.3"})"), rec.rule));
+  const TcRule before = *rec.rule;
+  const std::string portsBefore = rec.rule->ports;
 
-  Json::Value second = BaseRule();
-  second["port_type"] = "ALL";
-  second["port_num"] = "1,2,3,4,5,6,7,8,9,10";
-  second["enabled"] = false;
-  second["protocol"] = "udp";
-  second["minrate"] = 5;
-  second["maxrate"] = 6;
-  second["source"] = "all";
-  second["ip_direction"] = "dest";
   tcalloc::FailAfter(0);
-  EXPECT_FALSE(h_.RuleCreate(4, second, rec.rule));
-
+  EXPECT_FALSE(
+      h_.RuleCreate(4,
+                    Rule(R"({"port_type":"ALL","port_num":"1,2,3,4,5,6,7,8","enabled":false,)"
+                         R"("protocol":"udp","minrate":5,"maxrate":6,"ip_direction":"dest"})"),
+                    rec.rule));
   EXPECT_EQ(memcmp(&before, rec.rule, sizeof before), 0);  // ports pointer included
   EXPECT_EQ(std::string(rec.rule->ports), portsBefore);
   std::vector<std::string> logs = fake::LogBodies();
