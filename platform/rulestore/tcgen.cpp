@@ -124,15 +124,15 @@ bool ProtocolAllows(int protocol, uint8_t l4) {
          (protocol == ORVI_FW_PROTO_UDP && l4 == kUdp);
 }
 
-// (l4, port block) pairs of a port specification for the rule's protocol.
-int PortMatches(const PortSpec& spec, int protocol, std::vector<std::pair<uint8_t, PortBlock>>* out,
-                std::string* why) {
-  if (spec.type == PortSpec::kAll) {
+// (l4, port block) pairs of a ports field for the rule's protocol.
+int PortMatches(const PortField& field, int protocol,
+                std::vector<std::pair<uint8_t, PortBlock>>* out, std::string* why) {
+  if (field.type == PortField::kAll) {
     out->clear();
     return 0;
   }
-  if (spec.type == PortSpec::kSys) {
-    for (const std::string& name : SplitComma(spec.list)) {
+  if (field.type == PortField::kSys) {
+    for (const std::string& name : SplitComma(field.list)) {
       const std::vector<ServicePort>* ports = LookupService(name);
       if (ports == nullptr) {
         *why = "unknown service name";
@@ -154,7 +154,7 @@ int PortMatches(const PortSpec& spec, int protocol, std::vector<std::pair<uint8_
     return 0;
   }
   // SELF: single ports, or one range as the only item.
-  std::vector<std::string> items = SplitComma(spec.list);
+  std::vector<std::string> items = SplitComma(field.list);
   std::vector<PortBlock> blocks;
   if (items.size() == 1 && items[0].find('-') != std::string::npos) {
     const std::string& item = items[0];
@@ -284,20 +284,20 @@ bool ParseSource(const char* field, size_t fieldSize, Source* out) {
   return true;
 }
 
-bool ParsePortSpec(const char* text, PortSpec* out) {
+bool ParsePortField(const char* text, PortField* out) {
   if (text == nullptr || *text == '\0') return false;
-  *out = PortSpec();
+  *out = PortField();
   const size_t len = std::strlen(text);
   const char* rest = nullptr;
   if (StartsNoCase(text, "ALL")) {
-    out->type = PortSpec::kAll;
+    out->type = PortField::kAll;
     if (len == 3) return true;
     rest = text + 4;  // the separator after "ALL" is not examined
   } else if (StartsNoCase(text, "SELF:")) {
-    out->type = PortSpec::kSelf;
+    out->type = PortField::kSelf;
     rest = text + 5;
   } else if (StartsNoCase(text, "SYS:")) {
-    out->type = PortSpec::kSys;
+    out->type = PortField::kSys;
     rest = text + 4;
   } else {
     return false;
@@ -348,13 +348,13 @@ int ExpandRule(const TcRule& rule, std::vector<Match>* out, std::string* why) {
     *why = "unusable rates";
     return ORVI_TC_ERR_RATE;
   }
-  PortSpec spec;
-  if (!ParsePortSpec(rule.ports, &spec)) {
-    *why = "unreadable port specification";
+  PortField field;
+  if (!ParsePortField(rule.ports, &field)) {
+    *why = "unreadable ports field";
     return ORVI_TC_ERR_PORTS;
   }
   std::vector<std::pair<uint8_t, PortBlock>> ports;
-  int r = PortMatches(spec, protocol, &ports, why);
+  int r = PortMatches(field, protocol, &ports, why);
   if (r != 0) return r;
 
   std::vector<Family> families;
@@ -365,8 +365,8 @@ int ExpandRule(const TcRule& rule, std::vector<Match>* out, std::string* why) {
     m.family = family;
     m.source = src;
     m.addrIsSrc = rule.ipDirection == 1;
-    m.portIsSrc = spec.srcDir;
-    if (spec.type == PortSpec::kAll) {
+    m.portIsSrc = field.srcDir;
+    if (field.type == PortField::kAll) {
       m.l4 = protocol == ORVI_FW_PROTO_TCP ? kTcp : protocol == ORVI_FW_PROTO_UDP ? kUdp : kAnyL4;
       out->push_back(m);
       continue;

@@ -41,14 +41,14 @@ struct Source {
 // IPv4/IPv6 address or prefix, or a MAC address (also when unterminated).
 bool ParseSource(const char* field, size_t fieldSize, Source* out);
 
-struct PortSpec {
+struct PortField {
   enum Type { kAll, kSelf, kSys } type = kAll;
   std::string list;    // port list or service names, as stored
   bool srcDir = true;  // ports are source ports ("src"), else destination
 };
 // Reads the stored "TYPE:LIST:DIR" text (shorter forms such as "ALL" and
 // "SYS:cifs" included); false for anything unreadable.
-bool ParsePortSpec(const char* text, PortSpec* out);
+bool ParsePortField(const char* text, PortField* out);
 
 struct ServicePort {
   uint8_t l4;

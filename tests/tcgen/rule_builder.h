@@ -17,7 +17,7 @@ namespace tctest {
 struct RuleDef {
   int enabled;
   std::string source;
-  const char* ports;  // nullptr: a record without a port specification
+  const char* ports;  // nullptr: a record without a ports field
   int protocol;
   int minrate;
   int maxrate;

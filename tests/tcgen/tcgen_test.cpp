@@ -274,17 +274,17 @@ TEST(SplitPortRange, UsesFewestBlocks) {
   EXPECT_TRUE(tcgen::detail::SplitPortRange(0, 65536).empty());
 }
 
-struct SpecCase {
+struct FieldCase {
   const char* text;
   bool ok;
-  tcgen::detail::PortSpec::Type type;
+  tcgen::detail::PortField::Type type;
   const char* list;
   bool src;
 };
 
-TEST(ParsePortSpec, StoredForms) {
-  using T = tcgen::detail::PortSpec;
-  const SpecCase cases[] = {
+TEST(ParsePortField, StoredForms) {
+  using T = tcgen::detail::PortField;
+  const FieldCase cases[] = {
       {"ALL::src", true, T::kAll, "", true},
       {"ALL", true, T::kAll, "", true},
       {"all:80:DEST", true, T::kAll, "80", false},
@@ -300,16 +300,16 @@ TEST(ParsePortSpec, StoredForms) {
       {"TCP:80:src", false, T::kAll, "", true},
       {"", false, T::kAll, "", true},
   };
-  for (const SpecCase& c : cases) {
-    T spec;
-    ASSERT_EQ(tcgen::detail::ParsePortSpec(c.text, &spec), c.ok) << c.text;
+  for (const FieldCase& c : cases) {
+    T field;
+    ASSERT_EQ(tcgen::detail::ParsePortField(c.text, &field), c.ok) << c.text;
     if (!c.ok) continue;
-    EXPECT_EQ(spec.type, c.type) << c.text;
-    EXPECT_EQ(spec.list, c.list) << c.text;
-    EXPECT_EQ(spec.srcDir, c.src) << c.text;
+    EXPECT_EQ(field.type, c.type) << c.text;
+    EXPECT_EQ(field.list, c.list) << c.text;
+    EXPECT_EQ(field.srcDir, c.src) << c.text;
   }
-  tcgen::detail::PortSpec spec;
-  EXPECT_FALSE(tcgen::detail::ParsePortSpec(nullptr, &spec));
+  tcgen::detail::PortField field;
+  EXPECT_FALSE(tcgen::detail::ParsePortField(nullptr, &field));
 }
 
 TEST(ParseSource, AcceptedForms) {
