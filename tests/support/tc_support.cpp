@@ -267,6 +267,11 @@ RunResult Run(const std::vector<std::string>& argv,
   in.read.Close();
   out.write.Close();
   err.write.Close();
+  // Our ends must never block: a blocking write of a large input would wait
+  // for a child that is itself waiting for us to read its output.
+  for (int fd : {in.write.get(), out.read.get(), err.read.get()}) {
+    fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK);
+  }
 
   // Writing to a child that has already closed its input must give EPIPE,
   // not kill the test: block SIGPIPE in this thread while feeding it.
