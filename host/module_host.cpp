@@ -28,6 +28,10 @@ std::string DlError(const char* fallback) {
 std::unique_ptr<Module> Module::Load(const std::string& path, std::string* error) {
   // A bare file name would make dlopen search the library path instead of
   // opening the file the user named.
+  if (path.empty()) {
+    *error = "no module path given";
+    return nullptr;
+  }
   std::string file = path.find('/') == std::string::npos ? "./" + path : path;
   dlerror();
   void* handle = dlopen(file.c_str(), RTLD_NOW | RTLD_LOCAL);

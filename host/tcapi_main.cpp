@@ -68,20 +68,33 @@ struct HostOptions {
   std::string root;
   std::string module;
   bool logStderr = false;
+  // Given on the command line (even as ""), rather than left to the default.
+  bool rootGiven = false;
+  bool moduleGiven = false;
 };
 
 void AddHostOptions(CLI::App* cmd, HostOptions* options) {
-  cmd->add_option("--root", options->root,
-                  "appliance root directory (sets ORVI_ROOT; default: the environment's, or /)");
-  cmd->add_option("--module", options->module,
-                  "module to load (default: the one built beside tcapi)");
+  cmd->add_option_function<std::string>(
+      "--root",
+      [options](const std::string& value) {
+        options->root = value;
+        options->rootGiven = true;
+      },
+      "appliance root directory (sets ORVI_ROOT; default: the environment's, or /)");
+  cmd->add_option_function<std::string>(
+      "--module",
+      [options](const std::string& value) {
+        options->module = value;
+        options->moduleGiven = true;
+      },
+      "module to load (default: the one built beside tcapi)");
   cmd->add_flag("--log-stderr", options->logStderr, "copy the system log lines to standard error");
 }
 
 // Sets up the root and the log and loads the module; nullptr after printing
 // the reason.
 std::unique_ptr<tcapi::Module> Prepare(const HostOptions& options, std::string* rootShown) {
-  if (!options.root.empty()) {
+  if (options.rootGiven) {
     std::string absolute;
     std::string error;
     if (!tcapi::ResolveRoot(options.root, &absolute, &error)) {
@@ -99,7 +112,7 @@ std::unique_ptr<tcapi::Module> Prepare(const HostOptions& options, std::string* 
 
   std::string path = options.module;
   std::string error;
-  if (path.empty() && !DefaultModule(&path, &error)) {
+  if (!options.moduleGiven && !DefaultModule(&path, &error)) {
     Fail(error);
     return nullptr;
   }

@@ -69,6 +69,8 @@ TEST_F(TcapiCall, UsageAndLoadingErrorsExitTwoWithOneLine) {
       {"missing root",
        {"call", RulesApi(), "load", "{}", "--root", "/nonexistent/root"},
        "cannot use appliance root"},
+      {"empty root", {"call", RulesApi(), "load", "{}", "--root", ""}, "appliance root"},
+      {"empty module", {"call", RulesApi(), "load", "--module", ""}, "no module path"},
       {"root is a file",
        {"call", RulesApi(), "load", "{}", "--root", "@ROOT/etc/orviinfo.conf"},
        "is not a directory"},
