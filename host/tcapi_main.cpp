@@ -6,7 +6,10 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <stdio.h>
+
 #include <iostream>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -15,6 +18,8 @@
 #include "appliance_root.h"
 #include "http_server.h"
 #include "module_host.h"
+#include "olibc.h"
+#include "orvi_fw_tc.h"
 
 #ifndef TCAPI_VERSION
 #define TCAPI_VERSION "0.0.0"
@@ -162,6 +167,30 @@ int RunInitRoot(const std::string& dir, bool demo) {
   return kExitOk;
 }
 
+// Prints the tc batch that the live rules of one adapter give, through the
+// same checks as a reload, without applying anything.
+int RunPlan(const std::string& root, bool rootGiven, const std::string& adapter) {
+  if (rootGiven) {
+    std::string absolute;
+    std::string error;
+    if (!tcapi::ResolveRoot(root, &absolute, &error)) return Fail(error);
+    setenv("ORVI_ROOT", absolute.c_str(), 1);
+  }
+  char* batch = nullptr;
+  int r = ORVIFwTcRulePlan("/etc/tc", adapter.c_str(), &batch);
+  std::unique_ptr<char, decltype(&free)> owned(batch, &free);
+  if (r < 0) {
+    char detail[128];
+    snprintf(detail, sizeof detail, "error 0x%04X at %s:%d", OLIBCErrGet(), OLIBCErrorGetFile(),
+             OLIBCErrorGetLine());
+    std::cerr << "tcapi: no plan for " << tcapi::OneLine(adapter) << " (result " << r << ", "
+              << detail << ")" << std::endl;
+    return kExitApiError;
+  }
+  std::cout << owned.get();
+  return std::cout ? kExitOk : Fail("cannot write the batch to standard output");
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -194,6 +223,19 @@ int main(int argc, char** argv) {
   init->add_option("DIR", rootDir, "directory to create or complete")->required();
   init->add_flag("--demo", demo, "a router with interfaces eth0, eth1, wan0, br0, br1, gbr");
 
+  std::string planAdapter;
+  std::string planRoot;
+  bool planRootGiven = false;
+  CLI::App* plan = app.add_subcommand("plan", "print the tc batch of one adapter's live rules");
+  plan->add_option("ADAPTER", planAdapter, "adapter name (\"upload\": the WAN device)")->required();
+  plan->add_option_function<std::string>(
+      "--root",
+      [&](const std::string& value) {
+        planRoot = value;
+        planRootGiven = true;
+      },
+      "appliance root directory (sets ORVI_ROOT)");
+
   try {
     app.parse(argc, argv);
   } catch (const CLI::Success& e) {
@@ -205,6 +247,7 @@ int main(int argc, char** argv) {
   try {
     if (call->parsed()) return RunCall(callOptions, api, method, version, paramsText);
     if (serve->parsed()) return RunServe(serveOptions, listen);
+    if (plan->parsed()) return RunPlan(planRoot, planRootGiven, planAdapter);
     return RunInitRoot(rootDir, demo);
   } catch (const std::exception& e) {
     return Fail(std::string("internal error: ") + e.what());
