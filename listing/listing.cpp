@@ -35,24 +35,6 @@ class RuleListHolder {
   TcRuleList* list_ = nullptr;
 };
 
-// The adapter name list; pushes and the bridge enumeration may move it, so
-// they get the address of the held pointer.
-class SzListHolder {
- public:
-  explicit SzListHolder(SzList* list) : list_(list) {}
-  ~SzListHolder() {
-    if (list_ != nullptr) OLIBCSzListFree(list_);
-  }
-  SzListHolder(const SzListHolder&) = delete;
-  SzListHolder& operator=(const SzListHolder&) = delete;
-
-  SzList* Get() const { return list_; }
-  SzList** Out() { return &list_; }
-
- private:
-  SzList* list_;
-};
-
 // One stored record into one rule object. The rule object is reused across
 // records, so it is emptied first: a member of one record must never carry
 // over to the next. -1 when the port specification cannot be read (logged
@@ -119,49 +101,11 @@ void LoadAnswer(TCHandler& h, bool ok, Json::Value&& rules, int total) {
   h._pResponse->SetSuccess(h._respData);
 }
 
-// The text that decides a RouterRules direction. A value that is present but
-// not a string never matches; it is shown in its compact JSON form so that
-// the log says what the client sent.
-std::string DirectionText(const Json::Value& direction) {
-  if (direction.isString()) return direction.asString();
-  if (direction.isNull()) return std::string();
-  Json::StreamWriterBuilder writer;
-  writer["indentation"] = "";
-  return Json::writeString(writer, direction);
-}
-
 // Resolves "direction" into the adapters to read and gathers their rules.
 // The name list is released before this returns.
 bool RouterRulesGather(TCHandler& h, Json::Value& rules, int& total) {
-  const Json::Value direction = h._pRequest->GetParam("direction", Json::Value());
-  // Only a warning: the text decides below.
-  if (!direction.isString()) TC_LOG("Bad parameters");
-  const std::string text = DirectionText(direction);
-
-  SzListHolder names(OLIBCSzListAlloc(kAdapterListSize));
-  if (names.Get() == nullptr) {
-    TC_LOG_ERR("Failed to OLIBCSzListAlloc ");
-    h._errCode = TC_ERR_FAILED;
-    return false;
-  }
-  if (text == "upload") {
-    // Without the name the walk would read nothing and report success.
-    if (OLIBCSzListPush(names.Out(), "upload") < 0) {
-      TC_LOG_ERR("Failed to OLIBCSzListPush ");
-      h._errCode = TC_ERR_FAILED;
-      return false;
-    }
-  } else if (text == "download") {
-    if (BridgeListGet(names.Out()) < 0) {
-      TC_LOG("Bad parameters");
-      h._errCode = TC_ERR_INITIAL;
-      return false;
-    }
-  } else {
-    TC_LOG("Unknown direction %s", text.c_str());
-    h._errCode = TC_ERR_INITIAL;
-    return false;
-  }
+  SzListHolder names;
+  if (!RouterAdaptersSelect(h, kAdapterListSize, names)) return false;
 
   total = 0;
   {

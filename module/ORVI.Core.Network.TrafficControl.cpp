@@ -6,6 +6,7 @@
 #include <string.h>
 #include <strings.h>
 
+#include "json_util.h"
 #include "olibc.h"
 #include "preconditions.h"
 #include "sdk_network.h"
@@ -114,6 +115,42 @@ int BridgeListGet(SzList** list) {
     }
   }
   return 0;
+}
+
+bool RouterAdaptersSelect(TCHandler& h, int listSize, SzListHolder& names) {
+  const Json::Value direction = h._pRequest->GetParam("direction", Json::Value());
+  // Only a warning: the text decides below. A value that is present but not
+  // a string never matches; the log shows it as compact JSON.
+  if (!direction.isString()) TC_LOG("Bad parameters");
+  const std::string text = direction.isNull() ? std::string() : tcjson::Shown(direction);
+
+  names.Release();
+  *names.Out() = OLIBCSzListAlloc(listSize);
+  if (names.Get() == nullptr) {
+    TC_LOG_ERR("Failed to OLIBCSzListAlloc ");
+    h._errCode = TC_ERR_FAILED;
+    return false;
+  }
+  if (text == "upload") {
+    // Without the name the request would touch nothing and still succeed.
+    if (OLIBCSzListPush(names.Out(), "upload") < 0) {
+      TC_LOG_ERR("Failed to OLIBCSzListPush ");
+      h._errCode = TC_ERR_FAILED;
+      return false;
+    }
+    return true;
+  }
+  if (text == "download") {
+    if (BridgeListGet(names.Out()) < 0) {
+      TC_LOG("Bad parameters");
+      h._errCode = TC_ERR_INITIAL;
+      return false;
+    }
+    return true;
+  }
+  TC_LOG("Unknown direction %s", text.c_str());
+  h._errCode = TC_ERR_INITIAL;
+  return false;
 }
 
 int TCHandler::InterfaceCheck() {

@@ -19,6 +19,7 @@ namespace {
 // next save's staging copy does not touch it.
 const char kRescueDir[] = "/etc/tc_rescue";
 char* const kNoMoreArgs = nullptr;
+const int kAdapterListSize = 32;
 
 // One save's progress from the staging copy to its answer.
 struct SaveRun {
@@ -81,24 +82,6 @@ void Finish(TCHandler& h, SaveRun& run) {
   h._pResponse->SetError(h._errCode, Json::Value());
 }
 
-// Frees the adapter list of a router save on every way out.
-class AdapterList {
- public:
-  AdapterList() = default;
-  ~AdapterList() { Release(); }
-  AdapterList(const AdapterList&) = delete;
-  AdapterList& operator=(const AdapterList&) = delete;
-
-  SzList*& Get() { return list_; }
-  void Release() {
-    if (list_ != nullptr) OLIBCSzListFree(list_);
-    list_ = nullptr;
-  }
-
- private:
-  SzList* list_ = nullptr;
-};
-
 }  // namespace
 
 void TCHandler::RulesSave() {
@@ -119,59 +102,13 @@ void TCHandler::RulesSave() {
   Finish(*this, run);
 }
 
-namespace {
-
-// The text that decides the direction. A value that is not a string never
-// matches; the log shows it as compact JSON, as the load does.
-std::string DirectionText(const Json::Value& direction) {
-  if (direction.isString()) return direction.asString();
-  if (direction.isNull()) return std::string();
-  Json::StreamWriterBuilder writer;
-  writer["indentation"] = "";
-  return Json::writeString(writer, direction);
-}
-
-// Fills the adapter list of a router save from "direction"; false when the
-// save must end with the code the handler holds.
-bool SelectAdapters(TCHandler& h, SzList*& list) {
-  Json::Value param = h._pRequest->GetParam("direction", Json::Value());
-  if (!param.isString()) TC_LOG("Bad parameters");
-  const std::string direction = DirectionText(param);
-
-  list = OLIBCSzListAlloc(32);
-  if (list == nullptr) {
-    TC_LOG_ERR("Failed to OLIBCSzListAlloc ");
-    h._errCode = TC_ERR_FAILED;
-    return false;
-  }
-  if (direction == "upload") {
-    // Without the name the save would store nothing and still succeed.
-    if (OLIBCSzListPush(&list, "upload") < 0) {
-      TC_LOG_ERR("Failed to OLIBCSzListPush ");
-      h._errCode = TC_ERR_FAILED;
-      return false;
-    }
-    return true;
-  }
-  if (direction == "download") {
-    if (BridgeListGet(&list) < 0) {
-      TC_LOG("Bad parameters");
-      return false;
-    }
-    return true;
-  }
-  TC_LOG("Unknown direction %s", direction.c_str());
-  return false;
-}
-
-}  // namespace
-
 void TCHandler::RouterRulesSave() {
   SaveRun run;
-  AdapterList adapters;
+  SzListHolder adapters;
   // Every failure below ends in Finish, which answers again after a check
   // that answered itself; the code is the same, so the answer stands.
-  if (IsRouterMode() && SelectAdapters(*this, adapters.Get()) && RulesCheck() >= 0) {
+  if (IsRouterMode() && RouterAdaptersSelect(*this, kAdapterListSize, adapters) &&
+      RulesCheck() >= 0) {
     Json::Value rules = _pRequest->GetParam("rules", Json::Value());
     if (RuleValidator(rules) >= 0) {
       run.staging.lock();

@@ -32,6 +32,19 @@ class ScratchList {
   SzList* list_;
 };
 
+// Splits text at the commas into the scratch list; false after logging why.
+bool SplitPorts(const char* text, ScratchList& list) {
+  if (list.get() == nullptr) {
+    TC_LOG_ERR("Failed to allocate list");
+    return false;
+  }
+  if (OLIBCStrTok(text, kPortsSep, list.addr()) < 0) {
+    TC_LOG_ERR("Failed to strtok ports (%s)", text);
+    return false;
+  }
+  return true;
+}
+
 bool IsPort(const char* text) { return ORVIServiceConfPortsCheck(text) == 1; }
 
 }  // namespace
@@ -42,14 +55,7 @@ int TCHandler::PortsFormatNormalize(char const* ports, char** out, int* size) {
     return -1;
   }
   ScratchList list;
-  if (list.get() == nullptr) {
-    TC_LOG_ERR("Failed to allocate list");
-    return -1;
-  }
-  if (OLIBCStrTok(ports, kPortsSep, list.addr()) < 0) {
-    TC_LOG_ERR("Failed to strtok ports (%s)", ports);
-    return -1;
-  }
+  if (!SplitPorts(ports, list)) return -1;
   for (int i = 0; i < list.get()->count; ++i) {
     char* item = OLIBCSzListGet(list.get(), i);
     if (item == nullptr) continue;
@@ -80,14 +86,7 @@ int TCHandler::PortsSELFCheck(char const* szPorts) {
     return -1;
   }
   ScratchList list;
-  if (list.get() == nullptr) {
-    TC_LOG_ERR("Failed to allocate list");
-    return -1;
-  }
-  if (OLIBCStrTok(szPorts, kPortsSep, list.addr()) < 0) {
-    TC_LOG_ERR("Failed to strtok ports (%s)", szPorts);
-    return -1;
-  }
+  if (!SplitPorts(szPorts, list)) return -1;
   const int count = list.get()->count;
   for (int i = 0; i < count; ++i) {
     const char* stored = OLIBCSzListGet(list.get(), i);

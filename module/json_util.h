@@ -1,8 +1,8 @@
-// Small helpers for reading rule objects that come straight from a client:
+// Small helpers for reading JSON values that come straight from a client:
 // JsonCpp throws when a keyed lookup hits a value that is not an object, so
 // every lookup here checks the type first.
-#ifndef TC_VALIDATION_JSON_UTIL_H
-#define TC_VALIDATION_JSON_UTIL_H
+#ifndef TC_JSON_UTIL_H
+#define TC_JSON_UTIL_H
 
 #include <stdlib.h>
 
