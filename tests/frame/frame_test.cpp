@@ -7,6 +7,7 @@
 
 #include "ORVI.Core.Network.TrafficControl.h"
 #include "fake_platform.h"
+#include "test_json.h"
 #include "preconditions.h"
 
 using Lines = std::vector<std::string>;
@@ -21,12 +22,6 @@ class FrameTest : public ::testing::Test {
     EXPECT_EQ(fake::S().szListsOut, 0);
   }
 };
-
-Json::Value Params(const std::string& text) {
-  Json::Value v;
-  Json::Reader().parse(text, v);
-  return v;
-}
 
 TEST_F(FrameTest, TableHasFourRowsAndAZeroTerminator) {
   struct Row {
@@ -60,15 +55,19 @@ TEST_F(FrameTest, ConstructionReadsAdapterOnlyFromNonEmptyText) {
     const char* params;
     const char* adapter;
   } cases[] = {
-      {R"({"adapter":5})", ""},           {R"({"adapter":true})", ""},
-      {R"({"adapter":""})", ""},          {R"({})", ""},
-      {R"({"adapter":null})", ""},        {R"({"adapter":["eth0"]})", ""},
-      {R"({"adapter":"eth0"})", "eth0"},  {R"({"adapter":"  Eth0"})", "  Eth0"},
+      {R"({"adapter":5})", ""},
+      {R"({"adapter":true})", ""},
+      {R"({"adapter":""})", ""},
+      {R"({})", ""},
+      {R"({"adapter":null})", ""},
+      {R"({"adapter":["eth0"]})", ""},
+      {R"({"adapter":"eth0"})", "eth0"},
+      {R"({"adapter":"  Eth0"})", "  Eth0"},
       {R"({"adapter":"ETH0 "})", "ETH0 "},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.params);
-    ORVI::APIRequest req(Params(c.params));
+    ORVI::APIRequest req(J(c.params));
     ORVI::APIResponse resp;
     TCHandler h(&req, &resp);
     EXPECT_EQ(h._adapter, c.adapter);
@@ -127,7 +126,7 @@ TEST_F(FrameTest, ProtocolNameToNumber) {
 }
 
 TEST_F(FrameTest, InterfaceCheckMissingAdapterAnswers114BeforeEnumerating) {
-  ORVI::APIRequest req(Params(R"({"adapter":7})"));
+  ORVI::APIRequest req(J(R"({"adapter":7})"));
   ORVI::APIResponse resp;
   TCHandler h(&req, &resp);
   fake::S().interfaces = {"eth0"};
@@ -154,11 +153,19 @@ TEST_F(FrameTest, InterfaceCheckOutcomes) {
       {"enumeration fails", "eth0", true, -1, 1201, {"enum interface failed"}},
       {"case differs", "ETH0", false, -1, 4311, {"No such interface [ETH0][0x0000 :0]"}},
       {"blank kept", " eth0", false, -1, 4311, {"No such interface [ eth0][0x0000 :0]"}},
-      {"20 characters shown cut to 15", "abcdefghijklmnopqrst", false, -1, 4311,
+      {"20 characters shown cut to 15",
+       "abcdefghijklmnopqrst",
+       false,
+       -1,
+       4311,
        {"No such interface [abcdefghijklmno][0x0000 :0]"}},
       // The comparison uses the whole name: its first 15 characters are an
       // interface, the name is not.
-      {"prefix of a long name", "abcdefghijklmnoXYZ", false, -1, 4311,
+      {"prefix of a long name",
+       "abcdefghijklmnoXYZ",
+       false,
+       -1,
+       4311,
        {"No such interface [abcdefghijklmno][0x0000 :0]"}},
   };
   for (const auto& c : cases) {
@@ -199,7 +206,7 @@ TEST_F(FrameTest, RulesCheckLooksOnlyAtTheType) {
   for (const auto& c : cases) {
     SCOPED_TRACE(c.params);
     fake::Reset();
-    ORVI::APIRequest req(Params(c.params));
+    ORVI::APIRequest req(J(c.params));
     ORVI::APIResponse resp;
     TCHandler h(&req, &resp);
     EXPECT_EQ(h.RulesCheck(), c.result);
@@ -264,7 +271,11 @@ TEST_F(FrameTest, BridgeListDropsFirstGbrInAnyCase) {
       {"none", {"br0", "br1"}, nullptr, 0, {"br0", "br1"}, {}},
       {"empty", {}, nullptr, 0, {}, {}},
       {"removal fails", {"br0", "gbr"}, "OLIBCSzListRemove", -1, {"br0", "gbr"}, {}},
-      {"enumeration fails", {"br0"}, "OLIBNetEnumBridge", -1, {},
+      {"enumeration fails",
+       {"br0"},
+       "OLIBNetEnumBridge",
+       -1,
+       {},
        {"Failed to OLIBNetEnumBridge [0x0201 OLIBNetEnumBridge:1]"}},
   };
   for (const auto& c : cases) {
@@ -290,7 +301,7 @@ TEST_F(FrameTest, EntryFunctionAnswersOnceAndLeavesNothingBehind) {
   for (int i = 0; i < 2; ++i) {
     SCOPED_TRACE(table[i].method);
     fake::Reset();
-    ORVI::APIRequest req(Params(R"({"rules":[]})"));
+    ORVI::APIRequest req(J(R"({"rules":[]})"));
     ORVI::APIResponse resp;
     table[i].handler(&req, &resp);
     EXPECT_EQ(resp.AnswerCount(), 1);

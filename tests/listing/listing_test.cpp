@@ -8,20 +8,13 @@
 
 #include "ORVI.Core.Network.TrafficControl.h"
 #include "fake_platform.h"
+#include "test_json.h"
 
 namespace {
 
 using Strings = std::vector<std::string>;
 using fake::Rule;
 using fake::S;
-
-Json::Value J(const std::string& text) {
-  Json::Value v;
-  std::string errs;
-  std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-  EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &v, &errs)) << text;
-  return v;
-}
 
 // Compact text: compares numbers by value whatever their signedness.
 std::string Text(const Json::Value& v) {

@@ -11,24 +11,17 @@
 
 #include "ORVI.Core.Network.TrafficControl.h"
 #include "fake_platform.h"
+#include "test_json.h"
 #include "tcalloc.h"
 
 namespace {
 
-Json::Value ParseJson(const std::string& text) {
-  Json::Value value;
-  std::string errors;
-  std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-  EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, &errors)) << text;
-  return value;
-}
-
 // A validated rule; each case replaces some of its members ("-" removes one).
 Json::Value Rule(const std::string& patch = "{}") {
-  Json::Value rule = ParseJson(
-      R"({"enabled":true,"protocol":"tcp","minrate":100,"maxrate":200,"source":"all",)"
-      R"("ip_direction":"src","port_type":"SELF","port_num":"80","port_direction":"src"})");
-  Json::Value p = ParseJson(patch);
+  Json::Value rule =
+      J(R"({"enabled":true,"protocol":"tcp","minrate":100,"maxrate":200,"source":"all",)"
+        R"("ip_direction":"src","port_type":"SELF","port_num":"80","port_direction":"src"})");
+  Json::Value p = J(patch);
   for (const auto& key : p.getMemberNames()) {
     if (p[key] == "-") {
       rule.removeMember(key);

@@ -12,6 +12,7 @@
 
 #include "ORVI.Core.Network.TrafficControl.h"
 #include "fake_platform.h"
+#include "test_json.h"
 #include "tcalloc.h"
 
 namespace {
@@ -27,14 +28,6 @@ const char kMv[] = "OLIBCExec(/bin/mv,-f,/etc/tc_tmp,/etc/tc)";
 const char kReloadLive[] = "ORVIFwTcRuleReload(/etc/tc)";
 const char kRmRescue[] = "OLIBCExec(/bin/rm,-rf,/etc/tc_rescue)";
 const char kMvRescue[] = "OLIBCExec(/bin/mv,-f,/etc/tc_tmp,/etc/tc_rescue)";
-
-Json::Value ParseJson(const std::string& text) {
-  Json::Value value;
-  std::string errors;
-  std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-  EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, &errors)) << text;
-  return value;
-}
 
 // Two rules that pass validation, and how they are stored.
 const char kTwoRules[] =
@@ -86,7 +79,7 @@ class SaveTest : public ::testing::Test {
   }
 
   void Save(const std::string& params, bool router = false) {
-    ORVI::APIRequest req(ParseJson(params));
+    ORVI::APIRequest req(J(params));
     TCHandler h(&req, &resp_);
     if (router) {
       h.RouterRulesSave();
@@ -276,7 +269,7 @@ INSTANTIATE_TEST_SUITE_P(Cases, Refused, ::testing::ValuesIn(kRefusedCases),
 TEST_F(SaveTest, RuleThatCannotBeBuiltIsLeftOut) {
   // "ALL" rules: validating them allocates nothing, so the 2nd allocation is
   // the 2nd record's port text.
-  Json::Value params = ParseJson(std::string(R"({"adapter":"eth0","rules":)") + kTwoRules + "}");
+  Json::Value params = J(std::string(R"({"adapter":"eth0","rules":)") + kTwoRules + "}");
   params["rules"][1]["port_type"] = "ALL";
   params["rules"].append(params["rules"][0]);
   tcalloc::FailAfter(1);

@@ -12,6 +12,7 @@
 
 #include "ORVI.Core.Network.TrafficControl.h"
 #include "fake_platform.h"
+#include "test_json.h"
 #include "olibc.h"
 #include "tcalloc.h"
 
@@ -19,15 +20,6 @@ using Lines = std::vector<std::string>;
 
 // Error suffix while nothing is on the error stack.
 const std::string kNoErr = "[0x0000 :0]";
-
-inline Json::Value J(const std::string& text) {
-  Json::Value out;
-  std::string errors;
-  std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-  if (!reader->parse(text.data(), text.data() + text.size(), &out, &errors))
-    ADD_FAILURE() << "bad JSON in test: " << text << ": " << errors;
-  return out;
-}
 
 // The suffix the module prints for the error currently on the stack.
 inline std::string CurrentErr() {
