@@ -165,9 +165,13 @@ int TCHandler::InterfaceCheck() {
       TC_LOG("enum interface failed");
       _errCode = TC_ERR_FAILED;
     } else {
-      for (Json::ArrayIndex i = 0; i < interfaces.size(); ++i) {
-        const Json::Value& id = interfaces[i]["id"];
-        if (id.isString() && id.asString() == _adapter) return 0;
+      // Read-only lookups: the SDK's objects are trusted, but a stray element
+      // that is not an object must not throw.
+      const Json::Value& list = interfaces;
+      for (Json::ArrayIndex i = 0; list.isArray() && i < list.size(); ++i) {
+        const Json::Value* id = tcjson::Member(list[i], "id");
+        if (id != nullptr && (id->isString() || id->isNumeric()) && id->asString() == _adapter)
+          return 0;
       }
       TC_LOG_ERR("No such interface [%s]", shown);
       _errCode = TC_ERR_NO_INTERFACE;

@@ -49,7 +49,6 @@ bool TCHandler::RuleCreate(int id, Json::Value rule, _tag_orvi_firewall_tc_rule_
   size_t size = spec.size() + 1;
   char* ports = static_cast<char*>(tcalloc::Realloc(record->ports, size));
   if (ports == nullptr) {
-    TC_ERR_SET(OLIBC_ERR_NOMEM);
     TC_LOG_ERR("Failed to alloc memory");
     return false;
   }

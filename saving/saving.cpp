@@ -24,19 +24,19 @@ const int kAdapterListSize = 32;
 // One save's progress from the staging copy to its answer.
 struct SaveRun {
   std::unique_lock<std::mutex> staging{conflock::Staging(), std::defer_lock};
-  std::unique_lock<std::shared_mutex> live{conflock::Live(), std::defer_lock};
+  std::unique_lock<conflock::WriterFirstLock> live{conflock::Live(), std::defer_lock};
   bool applied = false;    // the rule store applied the staging directory
   bool succeeded = false;  // the staging directory is the live one now
   bool keptInStaging = false;
 };
 
-// The live directory is gone and the staging directory holds the only rules
-// left. Returns true when they could not be moved away and so must stay in
-// the staging directory.
+// The live directory is gone or incomplete and the staging directory holds
+// the only sure copy of the rules. Returns true when they could not be moved away and so must stay
+// in the staging directory.
 bool KeepStagingCopy() {
   bool moved = OLIBCExec("/bin/rm", "-rf", kRescueDir, kNoMoreArgs) >= 0 &&
                OLIBCExec("/bin/mv", "-f", kStagingDir, kRescueDir, kNoMoreArgs) >= 0;
-  TC_LOG("%s is missing: the applied rules are kept in %s", kLiveDir,
+  TC_LOG("%s may be gone or incomplete: the applied rules are kept in %s", kLiveDir,
          moved ? kRescueDir : kStagingDir);
   return !moved;
 }
@@ -48,13 +48,13 @@ void ApplyAndMove(TCHandler& h, SaveRun& run) {
     // Loads must not see the moment between removing the live directory and
     // moving the staging one in.
     run.live.lock();
-    bool liveRemoved = false;
-    if (staging::MoveReplacing(h, kStagingDir, kLiveDir, &liveRemoved)) {
+    bool liveTouched = false;
+    if (staging::MoveReplacing(h, kStagingDir, kLiveDir, &liveTouched)) {
       run.succeeded = true;
       run.live.unlock();
     } else {
       h._errCode = TC_ERR_FAILED;
-      if (liveRemoved) run.keptInStaging = KeepStagingCopy();
+      if (liveTouched) run.keptInStaging = KeepStagingCopy();
     }
   } else if (r == -2) {
     TC_LOG_ERR("ceil exceed system upper bound!");

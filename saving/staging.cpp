@@ -17,10 +17,12 @@ enum class Replace { kMove, kCopy };
 // Removes dst first so that dst ends up holding src itself rather than src
 // nested inside an older dst.
 bool RunReplacing(TCHandler& handler, Replace what, const char* src, const char* dst,
-                  bool* dstRemoved) {
-  *dstRemoved = false;
-  if (src == nullptr || dst == nullptr || !handler.ConfRemove(dst)) return false;
-  *dstRemoved = true;
+                  bool* dstTouched) {
+  *dstTouched = false;
+  if (src == nullptr || dst == nullptr) return false;
+  // A removal that fails may have removed part of dst all the same.
+  *dstTouched = true;
+  if (!handler.ConfRemove(dst)) return false;
   if (what == Replace::kMove) {
     if (OLIBCExec("/bin/mv", "-f", src, dst, kNoMoreArgs) < 0) {
       TC_LOG("Failed to mv -f (%s) (%s)", src, dst);
@@ -57,8 +59,8 @@ struct RuleFileWriter {
 
 namespace staging {
 
-bool MoveReplacing(TCHandler& handler, const char* src, const char* dst, bool* dstRemoved) {
-  return RunReplacing(handler, Replace::kMove, src, dst, dstRemoved);
+bool MoveReplacing(TCHandler& handler, const char* src, const char* dst, bool* dstTouched) {
+  return RunReplacing(handler, Replace::kMove, src, dst, dstTouched);
 }
 
 }  // namespace staging

@@ -6,10 +6,10 @@
 
 namespace staging {
 
-// ConfMove as the handler runs it, telling in addition whether the
-// destination had already been removed when the move program failed: then
-// the source is the only copy left of what the destination held.
-bool MoveReplacing(TCHandler& handler, const char* src, const char* dst, bool* dstRemoved);
+// ConfMove as the handler runs it, telling in addition whether the removal of
+// the destination had begun when the move failed: then the destination may be
+// gone or incomplete, and the source is the only sure copy of the rules.
+bool MoveReplacing(TCHandler& handler, const char* src, const char* dst, bool* dstTouched);
 
 }  // namespace staging
 

@@ -131,12 +131,17 @@ bool Kept(const OutcomeCase& c, const std::string& dir) {
 
 const char kRmLiveFailed[] = "Failed to rm -rf /etc/tc. ret=-1";
 const char kMvFailed[] = "Failed to mv -f (/etc/tc_tmp) (/etc/tc)";
-const char kKeptRescue[] = "/etc/tc is missing: the applied rules are kept in /etc/tc_rescue";
-const char kKeptStaging[] = "/etc/tc is missing: the applied rules are kept in /etc/tc_tmp";
+const char kKeptRescue[] =
+    "/etc/tc may be gone or incomplete: the applied rules are kept in /etc/tc_rescue";
+const char kKeptStaging[] =
+    "/etc/tc may be gone or incomplete: the applied rules are kept in /etc/tc_tmp";
 const char kDumpFailed[] = "failed to open rule file of %s";
 const std::vector<std::string> kApplied = {kRmTmp, kCp, kReloadTmp, kRmLive, kMv, kRmTmp};
 const std::vector<std::string> kRefused = {kRmTmp, kCp, kReloadTmp, kRmTmp};
-const std::vector<std::string> kLiveKept = {kRmTmp, kCp, kReloadTmp, kRmLive, kRmTmp, kReloadLive};
+// The removal of the live directory failed: it may be partly gone, so the
+// applied rules are kept too.
+const std::vector<std::string> kLiveKept = {kRmTmp,    kCp,       kReloadTmp, kRmLive,
+                                            kRmRescue, kMvRescue, kRmTmp,     kReloadLive};
 const std::vector<std::string> kRescued = {kRmTmp,    kCp,       kReloadTmp, kRmLive,    kMv,
                                            kRmRescue, kMvRescue, kRmTmp,     kReloadLive};
 
@@ -148,9 +153,9 @@ const OutcomeCase kOutcomes[] = {
   {"CeilingTooLarge",    {-3},    {},                          1203, kRefused, {"max ceil too large[0x0301 ORVIFwTcRuleReload:1]"}, Live::kOld, nullptr},
   {"ApplyFails",         {-1},    {},                          1201, kRefused, {"operation fail[0x0301 ORVIFwTcRuleReload:1]"}, Live::kOld, nullptr},
   {"ApplyFailsOddly",    {-9},    {},                          1201, kRefused, {"operation fail[0x0301 ORVIFwTcRuleReload:1]"}, Live::kOld, nullptr},
-  {"LiveStaysReapply0",  {0, 0},  {{"OLIBCExec /bin/rm", 2}},  1201, kLiveKept, {kRmLiveFailed}, Live::kOld, nullptr},
-  {"LiveStaysReapply1",  {0, 1},  {{"OLIBCExec /bin/rm", 2}},  1204, kLiveKept, {kRmLiveFailed}, Live::kOld, nullptr},
-  {"LiveStaysReapplyM1", {0, -1}, {{"OLIBCExec /bin/rm", 2}},  1204, kLiveKept, {kRmLiveFailed}, Live::kOld, nullptr},
+  {"LiveStaysReapply0",  {0, 0},  {{"OLIBCExec /bin/rm", 2}},  1201, kLiveKept, {kRmLiveFailed, kKeptRescue}, Live::kOld, "/etc/tc_rescue"},
+  {"LiveStaysReapply1",  {0, 1},  {{"OLIBCExec /bin/rm", 2}},  1204, kLiveKept, {kRmLiveFailed, kKeptRescue}, Live::kOld, "/etc/tc_rescue"},
+  {"LiveStaysReapplyM1", {0, -1}, {{"OLIBCExec /bin/rm", 2}},  1204, kLiveKept, {kRmLiveFailed, kKeptRescue}, Live::kOld, "/etc/tc_rescue"},
   {"MoveFailsKept",      {0, 0},  {{"OLIBCExec /bin/mv", 1}},  1201, kRescued, {kMvFailed, kKeptRescue}, Live::kGone, "/etc/tc_rescue"},
   {"MoveFailsKeptM1",    {0, -1}, {{"OLIBCExec /bin/mv", 1}},  1204, kRescued, {kMvFailed, kKeptRescue}, Live::kGone, "/etc/tc_rescue"},
   {"MoveFailsInStaging", {0, 0},  {{"OLIBCExec /bin/mv", 1}, {"OLIBCExec /bin/mv", 2}}, 1201,
