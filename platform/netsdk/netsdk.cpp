@@ -10,9 +10,9 @@
 #include <cctype>
 #include <climits>
 #include <cstdlib>
-#include <fstream>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "olibc.h"
@@ -20,10 +20,10 @@
 
 namespace {
 
-struct DirCloser {
-  void operator()(DIR* d) const { closedir(d); }
-};
-using DirPtr = std::unique_ptr<DIR, DirCloser>;
+using orvi::DirPtr;
+
+// sysfs attributes are one short line; anything longer is not one.
+const size_t kAttrMax = 4096;
 
 bool IsDir(const std::string& path) {
   struct stat st;
@@ -33,10 +33,10 @@ bool IsDir(const std::string& path) {
 // First line of a small sysfs attribute without surrounding blanks; false
 // when it cannot be read (missing, or EINVAL as "speed" gives on a link down).
 bool ReadAttr(const std::string& path, std::string& out) {
-  std::ifstream in(path);
-  if (!in || !std::getline(in, out)) return false;
+  if (!orvi::ReadRegularFile(path, kAttrMax, &out)) return false;
   size_t begin = 0;
-  size_t end = out.size();
+  size_t end = out.find('\n');
+  if (end == std::string::npos) end = out.size();
   while (begin < end && isspace(static_cast<unsigned char>(out[begin]))) ++begin;
   while (end > begin && isspace(static_cast<unsigned char>(out[end - 1]))) --end;
   out = out.substr(begin, end - begin);
@@ -97,7 +97,7 @@ bool EnumInterfacesStatus(Json::Value& interfaces) {
     item["bridge"] = IsDir(dev + "/bridge");
     item["speed_mbps"] = SpeedMbps(dev);
     item["up"] = IsUp(dev);
-    interfaces.append(item);
+    interfaces.append(std::move(item));
   }
   return true;
 }

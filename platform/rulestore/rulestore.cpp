@@ -60,19 +60,7 @@ constexpr long long kKBpsPerMbps = 125;
 // Longest directory path accepted, leaving room for the file names.
 constexpr size_t kMaxDirPath = PATH_MAX - 64;
 
-struct FdCloser {
-  int fd = -1;
-  explicit FdCloser(int f) : fd(f) {}
-  FdCloser(const FdCloser&) = delete;
-  FdCloser& operator=(const FdCloser&) = delete;
-  ~FdCloser() {
-    if (fd >= 0) close(fd);
-  }
-};
-
-struct DirCloser {
-  void operator()(DIR* d) const { closedir(d); }
-};
+using orvi::FdCloser;
 
 struct ListFree {
   void operator()(TcRuleList* list) const { ORVIFwTcRulesFreeByAdapter(list); }
@@ -144,37 +132,12 @@ bool WriteAll(int fd, const std::string& data) {
   return true;
 }
 
-// Reads a regular file of at most `limit` bytes; errno is set on failure.
-bool ReadWhole(const std::string& path, size_t limit, std::string* data) {
-  FdCloser fd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (fd.fd < 0) return false;
-  struct stat st;
-  if (fstat(fd.fd, &st) != 0) return false;
-  if (!S_ISREG(st.st_mode)) {
-    errno = EISDIR;
-    return false;
-  }
-  data->clear();
-  char buf[8192];
-  for (;;) {
-    ssize_t n = read(fd.fd, buf, sizeof(buf));
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return false;
-    if (n == 0) return true;
-    data->append(buf, static_cast<size_t>(n));
-    if (data->size() > limit) {
-      errno = EFBIG;
-      return false;
-    }
-  }
-}
-
 enum class Load { kOk, kMissing, kFailed };
 
 // Reads and parses one rule file; every failure is logged and recorded.
 Load LoadRuleFile(const std::string& path, rulefile::Parsed* parsed) {
   std::string data;
-  if (!ReadWhole(path, rulefile::kMaxFileBytes, &data)) {
+  if (!orvi::ReadRegularFile(path, rulefile::kMaxFileBytes, &data)) {
     if (errno == ENOENT) return Load::kMissing;
     int err = errno;
     syslog(LOG_ERR, "rulestore: cannot read rule file %s: %s", path.c_str(), std::strerror(err));
@@ -222,7 +185,7 @@ long long UpperBound(const std::string& dev) {
   }
   std::string text;
   long long mbps = -1;
-  if (ReadWhole(orvi::RootPath(kNetDir + dev + "/speed"), 64, &text)) {
+  if (orvi::ReadRegularFile(orvi::RootPath(kNetDir + dev + "/speed"), 64, &text)) {
     mbps = PositiveNumber(text.c_str());
   }
   if (mbps < 1) mbps = kDefaultSpeedMbps;
@@ -312,7 +275,7 @@ bool ApplyModeFromEnv(tcgen::ApplyMode* mode) {
 // Adapter names of the directory's rule files, sorted; false when the
 // directory cannot be listed (recorded).
 bool ListAdapters(const std::string& dir, std::vector<std::string>* adapters) {
-  std::unique_ptr<DIR, DirCloser> d(opendir(dir.c_str()));
+  orvi::DirPtr d(opendir(dir.c_str()));
   if (!d) {
     ORVI_ERR(OLIBC_ERR_IO);
     return false;
@@ -371,7 +334,8 @@ int Collect(const std::string& dir, Collected* out) {
     if (dev.empty()) continue;
     tcgen::DeviceRules& d = out->devices[dev];
     d.device = dev;
-    for (const TcRule* r = out->files[i].head.get(); r != nullptr; r = r->next) d.rules.push_back(r);
+    for (const TcRule* r = out->files[i].head.get(); r != nullptr; r = r->next)
+      d.rules.push_back(r);
   }
   for (auto& entry : out->devices) {
     entry.second.upperKBps = UpperBound(entry.first);
@@ -445,6 +409,9 @@ struct TcRuleFile {
   std::string dir;
   std::string adapter;
   std::string tmpPath;
+  // Rule lines wait here and go out in large writes: one write per rule
+  // made the writes cost more than building the lines.
+  std::string pending;
   int fd = -1;
   int count = 0;
   bool failed = false;
@@ -455,6 +422,18 @@ struct TcRuleFile {
     if (!committed && !tmpPath.empty()) unlink(tmpPath.c_str());
   }
 };
+
+namespace {
+
+constexpr size_t kWriteChunk = 64 * 1024;
+
+bool Flush(TcRuleFile* file) {
+  bool ok = WriteAll(file->fd, file->pending);
+  file->pending.clear();
+  return ok;
+}
+
+}  // namespace
 
 extern "C" {
 
@@ -520,7 +499,8 @@ TcRuleFile* ORVIFwTcRuleOpen(const char* dir, const char* adapter) {
       return nullptr;
     }
     file->tmpPath = name.data();
-    if (fchmod(file->fd, 0644) != 0 || !WriteAll(file->fd, rulefile::Header())) {
+    file->pending = rulefile::Header();
+    if (fchmod(file->fd, 0644) != 0) {
       ORVI_ERR(OLIBC_ERR_IO);
       return nullptr;
     }
@@ -561,7 +541,8 @@ int ORVIFwTcRuleWrite(TcRuleFile* file, const TcRule* rule) {
     return -1;
   }
   try {
-    if (!WriteAll(file->fd, rulefile::RuleLine(*rule))) {
+    file->pending += rulefile::RuleLine(*rule);
+    if (file->pending.size() >= kWriteChunk && !Flush(file)) {
       file->failed = true;
       ORVI_ERR(OLIBC_ERR_IO);
       return -1;
@@ -596,7 +577,8 @@ int ORVIFwTcRuleClose(const char* dir, TcRuleFile* file, const char* adapter) {
     }
     int fd = file->fd;
     file->fd = -1;
-    bool ok = WriteAll(fd, rulefile::EndLine(file->count)) && fsync(fd) == 0;
+    file->pending += rulefile::EndLine(file->count);
+    bool ok = WriteAll(fd, file->pending) && fsync(fd) == 0;
     ok = close(fd) == 0 && ok;
     std::string live = RulePath(file->dir, file->adapter);
     if (!ok || rename(file->tmpPath.c_str(), live.c_str()) != 0) {

@@ -9,7 +9,9 @@
 #include <cctype>
 #include <cstdio>
 #include <cstring>
-#include <fstream>
+#include <cerrno>
+#include <climits>
+#include <cstdlib>
 #include <map>
 
 #include "olibc.h"
@@ -198,10 +200,14 @@ std::string Printable(const char* field, size_t size) {
 
 // Link type of a device (ARPHRD_*), or -1 when the root does not say.
 int LinkType(const std::string& dev) {
-  std::ifstream in(orvi::RootPath("/sys/class/net/" + dev + "/type"));
-  int type = -1;
-  if (!(in >> type)) return -1;
-  return type;
+  std::string text;
+  if (!orvi::ReadRegularFile(orvi::RootPath("/sys/class/net/" + dev + "/type"), 64, &text))
+    return -1;
+  errno = 0;
+  char* end = nullptr;
+  long type = std::strtol(text.c_str(), &end, 10);
+  if (errno != 0 || end == text.c_str() || type < 0 || type > INT_MAX) return -1;
+  return static_cast<int>(type);
 }
 
 constexpr int kArphrdEther = 1;
