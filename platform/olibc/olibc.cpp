@@ -62,10 +62,7 @@ struct FileCloser {
 };
 using FilePtr = std::unique_ptr<FILE, FileCloser>;
 
-struct DirCloser {
-  void operator()(DIR* d) const { closedir(d); }
-};
-using DirPtr = std::unique_ptr<DIR, DirCloser>;
+using orvi::DirPtr;
 
 // getline's buffer, reused for every line and released on every return.
 struct LineBuf {
@@ -118,6 +115,38 @@ bool PrepareSpawnAttr(SpawnAttr& sa) {
          posix_spawnattr_setflags(&sa.attr, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF) == 0;
 }
 
+// Appends a copy of item[0, len) to a valid list; the list may move.
+int PushRange(SzList** list, const char* item, size_t len) {
+  SzList* l = *list;
+  char* copy = static_cast<char*>(malloc(len + 1));
+  if (copy == nullptr) {
+    ORVI_ERR(OLIBC_ERR_NOMEM);
+    return -1;
+  }
+  if (l->count == l->size) {
+    if (l->size > INT_MAX / 2) {
+      free(copy);
+      ORVI_ERR(OLIBC_ERR_NOMEM);
+      return -1;
+    }
+    int grown = l->size > 0 ? l->size * 2 : kMinListSize;
+    SzList* moved = static_cast<SzList*>(realloc(l, ListBytes(grown)));
+    if (moved == nullptr) {  // the old list is untouched and still the caller's
+      free(copy);
+      ORVI_ERR(OLIBC_ERR_NOMEM);
+      return -1;
+    }
+    l = moved;
+    l->size = grown;
+    l->items = ListSlots(l);
+    *list = l;
+  }
+  memcpy(copy, item, len);
+  copy[len] = '\0';
+  l->items[l->count++] = copy;
+  return 0;
+}
+
 // Exit status of a child whose exec failed after posix_spawn returned.
 constexpr int kExecFailedStatus = 127;
 
@@ -147,7 +176,9 @@ SzList* OLIBCSzListAlloc(int size) {
     ORVI_ERR(OLIBC_ERR_NOMEM);
     return nullptr;
   }
-  SzList* list = static_cast<SzList*>(calloc(1, ListBytes(size)));
+  // Only the slots below count are ever read, so they are not zeroed: callers
+  // ask for 1024 slots and mostly use a handful.
+  SzList* list = static_cast<SzList*>(malloc(ListBytes(size)));
   if (list == nullptr) {
     ORVI_ERR(OLIBC_ERR_NOMEM);
     return nullptr;
@@ -177,32 +208,7 @@ int OLIBCSzListPush(SzList** list, const char* item) {
     ORVI_ERR(OLIBC_ERR_INVAL);
     return -1;
   }
-  SzList* l = *list;
-  char* copy = strdup(item);
-  if (copy == nullptr) {
-    ORVI_ERR(OLIBC_ERR_NOMEM);
-    return -1;
-  }
-  if (l->count == l->size) {
-    if (l->size > INT_MAX / 2) {
-      free(copy);
-      ORVI_ERR(OLIBC_ERR_NOMEM);
-      return -1;
-    }
-    int grown = l->size > 0 ? l->size * 2 : kMinListSize;
-    SzList* moved = static_cast<SzList*>(realloc(l, ListBytes(grown)));
-    if (moved == nullptr) {  // the old list is untouched and still the caller's
-      free(copy);
-      ORVI_ERR(OLIBC_ERR_NOMEM);
-      return -1;
-    }
-    l = moved;
-    l->size = grown;
-    l->items = ListSlots(l);
-    *list = l;
-  }
-  l->items[l->count++] = copy;
-  return 0;
+  return PushRange(list, item, strlen(item));
 }
 
 int OLIBCSzListRemove(SzList* list, int index) {
@@ -266,18 +272,14 @@ int OLIBCStrTok(const char* text, const char* seps, SzList** list) {
   }
   if (*text == '\0') return 0;
   const int before = (*list)->count;
-  std::string token;
   for (const char* p = text;; ++p) {
-    if (*p == '\0' || strchr(seps, *p) != nullptr) {
-      if (OLIBCSzListPush(list, token.c_str()) < 0) {  // error already recorded
-        TruncateList(*list, before);
-        return -1;
-      }
-      if (*p == '\0') break;
-      token.clear();
-    } else {
-      token += *p;
+    const size_t len = strcspn(p, seps);
+    if (PushRange(list, p, len) < 0) {  // error already recorded
+      TruncateList(*list, before);
+      return -1;
     }
+    p += len;
+    if (*p == '\0') break;
   }
   return 0;
 }

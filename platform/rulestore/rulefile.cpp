@@ -49,20 +49,18 @@ int HexValue(char c) {
 bool Unescape(const char* b, const char* e, std::string* out) {
   out->clear();
   while (b < e) {
-    unsigned char c = static_cast<unsigned char>(*b);
-    if (c == '%') {
-      if (e - b < 3) return false;
-      int hi = HexValue(b[1]);
-      int lo = HexValue(b[2]);
-      if (hi < 0 || lo < 0 || (hi == 0 && lo == 0)) return false;
-      out->push_back(static_cast<char>(hi * 16 + lo));
-      b += 3;
-    } else if (IsRaw(c)) {
-      out->push_back(static_cast<char>(c));
-      ++b;
-    } else {
-      return false;
-    }
+    // Runs of raw bytes go in at once: escapes are rare in real rule files.
+    const char* run = b;
+    while (run < e && IsRaw(static_cast<unsigned char>(*run))) ++run;
+    out->append(b, run);
+    b = run;
+    if (b == e) break;
+    if (*b != '%' || e - b < 3) return false;
+    int hi = HexValue(b[1]);
+    int lo = HexValue(b[2]);
+    if (hi < 0 || lo < 0 || (hi == 0 && lo == 0)) return false;
+    out->push_back(static_cast<char>(hi * 16 + lo));
+    b += 3;
   }
   return true;
 }

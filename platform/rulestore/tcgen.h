@@ -14,8 +14,8 @@ namespace tcgen {
 
 // Everything the generator needs to know about one device.
 struct DeviceRules {
-  std::string device;              // kernel device name (e.g. "br0", "wan0")
-  long long upperKBps = 0;         // the device's upper bound in KB/s (1 KB = 1000 bytes)
+  std::string device;                // kernel device name (e.g. "br0", "wan0")
+  long long upperKBps = 0;           // the device's upper bound in KB/s (1 KB = 1000 bytes)
   std::vector<const TcRule*> rules;  // the file's rules in file order (disabled ones included)
 };
 
