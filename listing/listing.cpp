@@ -44,11 +44,12 @@ int RecordConvert(TCHandler& h, const TcRule& record, Json::Value& rule) {
   Json::Value port;
   rule["enabled"] = record.enabled != 0;
   if (h.PortsParseGet(record.ports, port) < 0) return -1;
-  rule["port_type"] = port["port_type"];
+  // The port object is discarded afterwards, so its strings are moved over.
+  rule["port_type"] = std::move(port["port_type"]);
   // The two are written together; the bare "ALL" form has neither.
   if (port.isMember("port_num")) {
-    rule["port_num"] = port["port_num"];
-    rule["port_direction"] = port["port_direction"];
+    rule["port_num"] = std::move(port["port_num"]);
+    rule["port_direction"] = std::move(port["port_direction"]);
   }
   // Read as a plain integer: a damaged or foreign store may hold a number
   // outside the enumeration, and loading that as the enum type is undefined.
@@ -85,7 +86,8 @@ int AdapterRulesRead(TCHandler& h, const char* adapter, Json::Value& rules) {
       h._errCode = TC_ERR_FAILED;
       return -1;
     }
-    rules.append(rule);
+    // Moved, not copied: the next record empties the object anyway.
+    rules.append(std::move(rule));
   }
   return count;
 }
