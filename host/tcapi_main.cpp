@@ -1,6 +1,7 @@
 // tcapi: loads a web API module and runs its methods from the command line
 // or over HTTP, in the real appliance root or a simulated one.
 #include <limits.h>
+#include <signal.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 #include <syslog.h>
@@ -194,6 +195,9 @@ int RunPlan(const std::string& root, bool rootGiven, const std::string& adapter)
 }  // namespace
 
 int main(int argc, char** argv) {
+  // A reader that goes away early (tcapi call ... | head) must give a write
+  // error and exit status 2, not a silent death by signal.
+  signal(SIGPIPE, SIG_IGN);
   CLI::App app{"tcapi: runs the methods of a web API module from the command line or over HTTP"};
   app.set_version_flag("--version", std::string("tcapi ") + TCAPI_VERSION);
   app.require_subcommand(1);
@@ -251,5 +255,8 @@ int main(int argc, char** argv) {
     return RunInitRoot(rootDir, demo);
   } catch (const std::exception& e) {
     return Fail(std::string("internal error: ") + e.what());
+  } catch (...) {
+    // A module may throw anything from its loading code or its table.
+    return Fail("internal error: an exception that is not a std::exception");
   }
 }
