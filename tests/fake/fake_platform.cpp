@@ -14,8 +14,7 @@
 #include "sdk_network.h"
 
 namespace fake {
-namespace {
-}  // namespace
+namespace {}  // namespace
 State gState;
 namespace {
 std::vector<std::string> gBadFrames;
@@ -177,8 +176,7 @@ int OLIBCSzListRemove(SzList* list, int index) {
   if (fake::Fails("OLIBCSzListRemove") || list == nullptr || index < 0 || index >= list->count)
     return 0;
   free(list->items[index]);
-  memmove(&list->items[index], &list->items[index + 1],
-          (list->count - index - 1) * sizeof(char*));
+  memmove(&list->items[index], &list->items[index + 1], (list->count - index - 1) * sizeof(char*));
   --list->count;
   return 1;
 }
@@ -241,7 +239,9 @@ int OLIBCFileGetKeyValue(const char* path, const char* key, char* buf, int size,
 }
 
 namespace {
-void CopyDir(const std::string& src, const std::string& dst) { gState.dirs[dst] = gState.dirs[src]; }
+void CopyDir(const std::string& src, const std::string& dst) {
+  gState.dirs[dst] = gState.dirs[src];
+}
 }  // namespace
 
 int OLIBCExec(const char* program, ...) {

@@ -31,8 +31,8 @@ using Dir = std::map<std::string, RuleFile>;  // adapter name -> its rule file
 
 // A scripted answer of ORVIFwTcRuleGetByAdapter for one adapter.
 struct GetScript {
-  int result = 0;          // returned as is
-  bool nullHead = false;   // hand out a list whose chain head is NULL
+  int result = 0;         // returned as is
+  bool nullHead = false;  // hand out a list whose chain head is NULL
 };
 
 struct State {
@@ -54,8 +54,8 @@ struct State {
   // Rule store: in-memory configuration directories, changed by the rule
   // file operations and by OLIBCExec of /bin/rm, /bin/mv and /bin/cp.
   std::map<std::string, Dir> dirs;
-  std::map<std::string, GetScript> getScript;  // adapter -> scripted read
-  std::deque<int> reloadResults;               // next reload answers; 0 when empty
+  std::map<std::string, GetScript> getScript;               // adapter -> scripted read
+  std::deque<int> reloadResults;                            // next reload answers; 0 when empty
   std::vector<std::map<std::string, Dir>> reloadSnapshots;  // dirs at each reload
 
   // Outstanding allocations handed to the module.
