@@ -1,5 +1,7 @@
 // Rule files: what is written comes back byte for byte, what is damaged is
 // refused, and no name or failed write can touch anything it should not.
+#include <sys/stat.h>
+
 #include <climits>
 #include <cstring>
 #include <filesystem>
@@ -222,8 +224,14 @@ TEST_F(RuleFiles, NullsAndBadDirectoriesFailWithAnError) {
       {"reload NULL", [] { return ORVIFwTcRuleReload(nullptr); }, OLIBC_ERR_INVAL},
       {"reload empty", [] { return ORVIFwTcRuleReload(""); }, OLIBC_ERR_INVAL},
       {"reload missing dir", [] { return ORVIFwTcRuleReload("/etc/none"); }, OLIBC_ERR_IO},
+      // A FIFO must be refused, not waited on for a writer that never comes.
+      {"get a FIFO", [&] { return ORVIFwTcRuleGetByAdapter("/etc/fifo", "eth0", &list); },
+       OLIBC_ERR_IO},
+      {"reload a FIFO", [] { return ORVIFwTcRuleReload("/etc/fifo"); }, OLIBC_ERR_IO},
   };
   Put("/etc/tc/x", "not a directory");
+  Put("/etc/fifo/keep", "");
+  ASSERT_EQ(mkfifo(Path("/etc/fifo/eth0.rules").c_str(), 0600), 0);
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     OLIBCErrSetEx(0, "", 0);
