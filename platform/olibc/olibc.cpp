@@ -91,10 +91,16 @@ void TrimRange(const char*& begin, const char*& end) {
 
 struct SpawnAttr {
   posix_spawnattr_t attr;
+  posix_spawn_file_actions_t actions;
   bool ok;
-  SpawnAttr() { ok = posix_spawnattr_init(&attr) == 0; }
+  bool actionsOk;
+  SpawnAttr() {
+    ok = posix_spawnattr_init(&attr) == 0;
+    actionsOk = posix_spawn_file_actions_init(&actions) == 0;
+  }
   ~SpawnAttr() {
     if (ok) posix_spawnattr_destroy(&attr);
+    if (actionsOk) posix_spawn_file_actions_destroy(&actions);
   }
   SpawnAttr(const SpawnAttr&) = delete;
   SpawnAttr& operator=(const SpawnAttr&) = delete;
@@ -103,7 +109,11 @@ struct SpawnAttr {
 // The child starts with default signal dispositions and an empty mask, so a
 // host that ignores SIGPIPE or blocks SIGTERM does not hand that on to cp or tc.
 bool PrepareSpawnAttr(SpawnAttr& sa) {
-  if (!sa.ok) return false;
+  if (!sa.ok || !sa.actionsOk) return false;
+#if defined(__GLIBC__) && (__GLIBC__ > 2 || (__GLIBC__ == 2 && __GLIBC_MINOR__ >= 34))
+  // The host's sockets and files are none of rm's or cp's business.
+  if (posix_spawn_file_actions_addclosefrom_np(&sa.actions, 3) != 0) return false;
+#endif
   sigset_t none;
   sigset_t all;
   sigemptyset(&none);
@@ -379,7 +389,7 @@ int OLIBCExec(const char* program, ...) {
     return -1;
   }
   pid_t pid = -1;
-  if (posix_spawn(&pid, program, nullptr, &sa.attr, argv.data(), environ) != 0) {
+  if (posix_spawn(&pid, program, &sa.actions, &sa.attr, argv.data(), environ) != 0) {
     ORVI_ERR(OLIBC_ERR_SPAWN);
     return -1;
   }

@@ -1,5 +1,6 @@
 #include "olibc.h"
 
+#include <fcntl.h>
 #include <stdlib.h>
 #include <string.h>
 
@@ -336,6 +337,15 @@ TEST(Exec, PassesArgumentsResolvedUnderTheRoot) {
   std::stringstream text;
   text << in.rdbuf();
   EXPECT_EQ(text.str(), root.Dir() + "/etc/tc\na b;$HOME\n");
+}
+
+// A descriptor the host left inheritable does not reach the program.
+TEST(Exec, HostDescriptorsStayWithTheHost) {
+  int fd = open("/dev/null", O_RDONLY);  // no O_CLOEXEC on purpose
+  ASSERT_GE(fd, 3);
+  const std::string text = std::to_string(fd);
+  EXPECT_EQ(OLIBCExec(EXEC_HELPER, "closed", text.c_str(), nullptr), 0);
+  close(fd);
 }
 
 TEST(Exec, CopiesADirectoryInsideTheRoot) {
