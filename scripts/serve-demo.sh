@@ -9,29 +9,8 @@ set -euo pipefail
 cd "$(dirname "${BASH_SOURCE[0]}")/.."
 
 listen="${TCAPI_LISTEN:-127.0.0.1:8080}"
-packages=(build-essential cmake ninja-build pkg-config libjsoncpp-dev libgtest-dev libgmock-dev
-          libbenchmark-dev libcpp-httplib-dev libcli11-dev iproute2)
-
-missing=()
-for pkg in "${packages[@]}"; do
-  if ! dpkg-query -W -f='${Status}' "$pkg" 2>/dev/null | grep -q 'install ok installed'; then
-    missing+=("$pkg")
-  fi
-done
-if ((${#missing[@]} > 0)); then
-  echo "Installing: ${missing[*]}"
-  if [[ $(id -u) -eq 0 ]]; then
-    sudo=()
-  elif command -v sudo >/dev/null; then
-    sudo=(sudo)
-  else
-    echo "serve-demo: missing packages (${missing[*]}); run as root or install them" >&2
-    exit 1
-  fi
-  "${sudo[@]}" apt-get update
-  "${sudo[@]}" env DEBIAN_FRONTEND=noninteractive apt-get install -y --no-install-recommends \
-    "${missing[@]}"
-fi
+# curl for the example requests printed below.
+bash scripts/install-deps.sh curl
 
 cmake --preset release
 cmake --build --preset release
@@ -47,10 +26,10 @@ cat <<EOF
 
 Example requests (one per method):
 
-  curl -s -X POST -d '{"adapter":"eth0"}' ${base}/ORVI.Core.Network.TrafficControl.Rules/1/load
-  curl -s -X POST -d '{"adapter":"eth0","rules":[${rule}]}' ${base}/ORVI.Core.Network.TrafficControl.Rules/1/save
-  curl -s -X POST -d '{"direction":"upload"}' ${base}/ORVI.Core.Network.TrafficControl.RouterRules/1/load
-  curl -s -X POST -d '{"direction":"upload","rules":[${rule}]}' ${base}/ORVI.Core.Network.TrafficControl.RouterRules/1/save
+  curl -s -H 'Content-Type: application/json' -d '{"adapter":"eth0"}' ${base}/ORVI.Core.Network.TrafficControl.Rules/1/load
+  curl -s -H 'Content-Type: application/json' -d '{"adapter":"eth0","rules":[${rule}]}' ${base}/ORVI.Core.Network.TrafficControl.Rules/1/save
+  curl -s -H 'Content-Type: application/json' -d '{"direction":"upload"}' ${base}/ORVI.Core.Network.TrafficControl.RouterRules/1/load
+  curl -s -H 'Content-Type: application/json' -d '{"direction":"upload","rules":[${rule}]}' ${base}/ORVI.Core.Network.TrafficControl.RouterRules/1/save
 
 The same without a server: ${tcapi} call ORVI.Core.Network.TrafficControl.Rules load '{"adapter":"eth0"}' --root demo-root
 Stop the server with Ctrl-C.
