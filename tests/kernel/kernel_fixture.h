@@ -21,7 +21,12 @@ class KernelTest : public ::testing::Test {
     std::string why = KernelTestsUnavailable();
     if (why.empty()) {
       topo_.reset(new Topology);
-      if (!topo_->Create(&why)) why = "no usable network namespaces: " + why;
+      if (!topo_->Create(&why)) {
+        why = "no usable network namespaces: " + why;
+      } else {
+        why = topo_->TrafficControlUnavailable();
+        if (!why.empty()) why = "the kernel lacks HTB, u32 or pfifo: " + why;
+      }
     }
     if (!why.empty()) {
       std::fprintf(stderr, "SKIPPED: %s\n", why.c_str());

@@ -253,6 +253,28 @@ std::string Topology::Tc(const std::string& ns, const std::vector<std::string>& 
   return r.exitCode == 0 ? r.out : std::string();
 }
 
+std::string Topology::TrafficControlUnavailable() const {
+  const std::vector<std::vector<std::string>> probe = {
+      {"qdisc", "add", "dev", "br0", "root", "handle", "1:", "htb", "default", "2"},
+      {"class", "add", "dev", "br0", "parent", "1:", "classid", "1:2", "htb", "rate", "1mbit"},
+      {"qdisc", "add", "dev", "br0", "parent", "1:2", "handle", "2:", "pfifo", "limit", "10"},
+      {"filter", "add", "dev", "br0", "parent", "1:", "protocol", "ip", "prio", "1", "u32",
+       "match", "u32", "0", "0", "flowid", "1:2"},
+  };
+  std::string why;
+  for (const auto& args : probe) {
+    std::vector<std::string> argv{TcPath()};
+    argv.insert(argv.end(), args.begin(), args.end());
+    ProcResult r = Exec(r_, argv);
+    if (r.exitCode != 0) {
+      why = "tc " + args[0] + " " + args[1] + " failed: " + r.err;
+      break;
+    }
+  }
+  Exec(r_, {TcPath(), "qdisc", "del", "dev", "br0", "root"});
+  return why;
+}
+
 InNamespace::InNamespace(const std::string& ns) {
   original_ = open("/proc/thread-self/ns/net", O_RDONLY | O_CLOEXEC);
   int target = open(("/run/netns/" + ns).c_str(), O_RDONLY | O_CLOEXEC);

@@ -72,6 +72,9 @@ class Topology {
                   const std::map<std::string, std::string>& extraEnv = {}) const;
   // `tc ARGS...` inside NS; the standard output (empty on failure).
   std::string Tc(const std::string& ns, const std::vector<std::string>& args) const;
+  // "" when the kernel takes an HTB root, a u32 filter and a pfifo leaf on
+  // the bridge of R; else why not (a kernel built without them).
+  std::string TrafficControlUnavailable() const;
 
  private:
   bool Ip(const std::vector<std::string>& args, std::string* error);
