@@ -413,6 +413,11 @@ std::string GenerateWith(const DeviceRules& dev, const Classifier& classifier,
     planned.push_back(std::move(p));
   }
   if (planned.empty()) return b;
+  // Room for every line up front: the batch of a large rule set runs to
+  // hundreds of kilobytes, and growing it step by step copied it each time.
+  size_t lines = 0;
+  for (const Planned& p : planned) lines += 2 + p.matches.size();
+  b.reserve(b.size() + 256 * (lines + 4));
 
   const long long upper = std::min(dev.upperKBps, kMaxKBps);
   b += "qdisc add dev " + d + " root handle 1: htb default " + Hex(kDefaultMinor) + "\n";

@@ -91,9 +91,15 @@ void AppendKeys(const Match& m, SourceText& sources, std::string* k) {
     k->append(ip);
     k->append(m.portIsSrc ? " sport " : " dport ");
     AppendUnsigned(k, m.port.value);
-    char mask[8];
-    std::snprintf(mask, sizeof mask, " 0x%04x", m.port.mask);
-    k->append(mask);
+    static const char kHex[] = "0123456789abcdef";
+    const char mask[] = {' ',
+                         '0',
+                         'x',
+                         kHex[(m.port.mask >> 12) & 0xf],
+                         kHex[(m.port.mask >> 8) & 0xf],
+                         kHex[(m.port.mask >> 4) & 0xf],
+                         kHex[m.port.mask & 0xf]};
+    k->append(mask, sizeof mask);
   }
   if (k->size() == start) k->append(" match u32 0 0");  // everything of this protocol
 }
