@@ -107,6 +107,7 @@ TEST_F(ValidationTest, SelfCheckRefusals) {
       {"99999,1000-2000", "Format error! (99999)" + num},
       {"-1", "Format error! ()" + num},                // empty low end
       {"abc-70000", "Format error! (70000)" + num},    // high end is looked at first
+      {"1000-", "Format error! ()" + num},             // empty high end, before the low one
       {"1000 - 2000", "Format error! ( 2000)" + num},  // blanks inside stay
       {"1-2-3", "Format error! (2-3)" + num},
       {"+80", "Format error! (+80)" + num},
