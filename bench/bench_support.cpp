@@ -82,16 +82,16 @@ bool StoreRules(const char* dir, const char* adapter, int count, int portsPerRul
     }
     for (int i = 0; ok && i < count; ++i) {
       TcRule* r = record.Get();
-      const std::string spec = "SELF:" + PortList(i, portsPerRule) + ":dest";
+      const std::string text = "SELF:" + PortList(i, portsPerRule) + ":dest";
       // The store frees the ports text with the record, so it comes from malloc.
-      char* ports = static_cast<char*>(realloc(r->ports, spec.size() + 1));
-      if (ports == nullptr) {
+      char* block = static_cast<char*>(realloc(r->ports, text.size() + 1));
+      if (block == nullptr) {
         *error = "out of memory";
         ok = false;
         break;
       }
-      r->ports = ports;
-      memcpy(r->ports, spec.c_str(), spec.size() + 1);
+      r->ports = block;
+      memcpy(r->ports, text.c_str(), text.size() + 1);
       r->id = i + 1;
       r->enabled = 1;
       snprintf(r->source, sizeof r->source, "%s", Source(i).c_str());

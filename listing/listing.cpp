@@ -37,7 +37,7 @@ class RuleListHolder {
 
 // One stored record into one rule object. The rule object is reused across
 // records, so it is emptied first: a member of one record must never carry
-// over to the next. -1 when the port specification cannot be read (logged
+// over to the next. -1 when the stored ports text cannot be read (logged
 // where it is found).
 int RecordConvert(TCHandler& h, const TcRule& record, Json::Value& rule) {
   rule.clear();

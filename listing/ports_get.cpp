@@ -1,4 +1,4 @@
-// Reading a stored port specification ("ALL::src", "SELF:777:src", "SYS:cifs")
+// Reading a stored ports field ("ALL::src", "SELF:777:src", "SYS:cifs")
 // back into the three port members of a rule object.
 #include <string.h>
 #include <strings.h>

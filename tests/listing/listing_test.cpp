@@ -281,7 +281,7 @@ TEST(RouterRulesLoad, WalksAdaptersInOrder) {
        {{"br1", {-1, false}}}, nullptr, "error 1201",
        {"Failed to load Tc rules for adapter [br1][0x0201 ORVIFwTcRuleGetByAdapter:1]"},
        {"get br0", "free br0", "get br1", "free NULL"}},
-      {"second unreadable spec", "download", {"br0", "br1"}, {{"br0", a2}, {"br1", bBad}}, {},
+      {"second unreadable ports field", "download", {"br0", "br1"}, {{"br0", a2}, {"br1", bBad}}, {},
        nullptr, "error 1201", {"port format should be one of ALL/SELF/SYS, ex: ALL::src, "
                                "SELF:777:src, SYS:cifs[0x0000 :0]"}, two},
       {"enumeration fails", "download", {"br0"}, {{"br0", a2}}, {}, "OLIBNetEnumBridge",

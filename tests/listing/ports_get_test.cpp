@@ -1,4 +1,4 @@
-// Reading stored port specifications back into rule object members.
+// Reading stored ports fields back into rule object members.
 #include <gtest/gtest.h>
 
 #include <string>
