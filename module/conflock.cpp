@@ -1,18 +1,9 @@
 #include "conflock.h"
 
-#include <stdlib.h>
-
 namespace conflock {
 
-WriterFirstLock::WriterFirstLock() {
-  pthread_rwlockattr_t attr;
-  pthread_rwlockattr_init(&attr);
-  pthread_rwlockattr_setkind_np(&attr, PTHREAD_RWLOCK_PREFER_WRITER_NONRECURSIVE_NP);
-  // Only fails for lack of resources at start-up; running without the lock
-  // would silently lose its guarantees.
-  if (pthread_rwlock_init(&lock_, &attr) != 0) abort();
-  pthread_rwlockattr_destroy(&attr);
-}
+// A static initializer cannot fail, so there is no error path to handle.
+WriterFirstLock::WriterFirstLock() : lock_(PTHREAD_RWLOCK_WRITER_NONRECURSIVE_INITIALIZER_NP) {}
 
 WriterFirstLock::~WriterFirstLock() { pthread_rwlock_destroy(&lock_); }
 
